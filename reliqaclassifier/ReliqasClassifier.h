@@ -1,0 +1,58 @@
+// ReliqasClassifier: the one object through which a host uses the system.
+//
+// Holds the loaded boosted-tree model and two cache managers over the host's
+// persistent store (keys "<prefix>_model", "_model_id", "_threshold",
+// "_server_features"). Only the model lives in memory; identifier, threshold and
+// server features are read from the store on every use, so updates are seen by
+// the next call and survive a restart of the process.
+//
+// Thread-safety: every operation may be called from any thread at any time.
+// One mutex serialises store access, model replacement and scoring; feature
+// extraction runs outside it.
+//
+// Errors: store failures never reach the caller (logged, defaults used).
+// Undecodable stored values, a stored model that the reader rejects (in the
+// constructor and in setModelParams), allocation failures of feature
+// extraction and non-finite values met while writing JSON leave as exceptions.
+#pragma once
+
+#include <memory>
+#include <mutex>
+#include <string>
+
+#include "reliqaclassifier/ReliqaClassifierInput.h"
+#include "reliqaclassifier/ReliqaClassifierResult.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/CacheManager.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FeatureMap.h"
+
+namespace thornvale {
+class BoostingModel;
+}
+
+namespace kestrova::reliqaclassifier {
+
+using thornvale::FeatureMap;
+using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
+
+class ReliqasClassifier {
+ public:
+  // Key prefix "RELIQA". `store` may be empty: every store access is then
+  // logged as "cache not initiated" and defaults are used.
+  explicit ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> store);
+  ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> store, const std::string& keyPrefix);
+  ~ReliqasClassifier();
+
+  ReliqasClassifier(const ReliqasClassifier&) = delete;
+  ReliqasClassifier& operator=(const ReliqasClassifier&) = delete;
+
+  ReliqaClassifierResult classify(const ReliqaClassifierInput& input);
+  void setModelParams(const ReliqaClassifierModelParams& params);
+  void setServerFeatures(const FeatureMap& features);
+  std::string currentlyUsedModelId();
+
+ private:
+  // (members are the implementation's: mutex, modelParamsCache,
+  // serverFeaturesCache, model)
+};
+
+}  // namespace kestrova::reliqaclassifier

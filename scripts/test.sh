@@ -1,0 +1,68 @@
+#!/usr/bin/env bash
+# Runs every test of the project on a fresh Debian 12 machine:
+#   1. the GoogleTest suite (plain build, ctest),
+#   2. the same suite built with AddressSanitizer + UndefinedBehaviorSanitizer,
+#   3. the same suite built with ThreadSanitizer,
+#   4. each libFuzzer target for FUZZ_SECONDS (default 60) on its seed corpus,
+#   5. the JVM suite and the trainer cross-check, when they are present.
+# Any failure or sanitizer report makes it exit non-zero.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+ROOT=$PWD
+FUZZ_SECONDS=${FUZZ_SECONDS:-60}
+JOBS=${JOBS:-$(nproc)}
+
+bash scripts/setup.sh
+
+step() { printf '\n==== %s\n' "$*"; }
+
+configure() {  # configure <dir> <cmake args...>
+  local dir=$1; shift
+  cmake -S "$ROOT" -B "$dir" -G Ninja -Wno-dev "$@" >/dev/null
+}
+
+step "plain build and tests"
+configure build
+cmake --build build -j "$JOBS"
+ctest --test-dir build --output-on-failure -j "$JOBS"
+
+export ASAN_OPTIONS=abort_on_error=1:detect_leaks=1:strict_string_checks=1
+export UBSAN_OPTIONS=halt_on_error=1:print_stacktrace=1
+export TSAN_OPTIONS=halt_on_error=1:second_deadlock_stack=1
+
+step "AddressSanitizer + UndefinedBehaviorSanitizer build and tests"
+configure build-asan -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ \
+  -DRELIQA_SANITIZER=asan -DRELIQA_BENCH=OFF -DCMAKE_BUILD_TYPE=RelWithDebInfo
+cmake --build build-asan -j "$JOBS"
+ctest --test-dir build-asan --output-on-failure -j "$JOBS" -LE no-sanitizer
+
+step "ThreadSanitizer build and tests"
+configure build-tsan -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ \
+  -DRELIQA_SANITIZER=tsan -DRELIQA_BENCH=OFF -DCMAKE_BUILD_TYPE=RelWithDebInfo
+cmake --build build-tsan -j "$JOBS"
+ctest --test-dir build-tsan --output-on-failure -j "$JOBS" -LE no-sanitizer
+
+step "fuzzing, ${FUZZ_SECONDS}s per target"
+configure build-fuzz -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ \
+  -DRELIQA_FUZZ=ON -DRELIQA_BENCH=OFF -DCMAKE_BUILD_TYPE=RelWithDebInfo
+cmake --build build-fuzz -j "$JOBS" --target fuzz_targets
+for target in build-fuzz/bin/fuzz_*; do
+  name=$(basename "$target")
+  seeds="fuzz/corpus/${name#fuzz_}"
+  work=$(mktemp -d)
+  [ -d "$seeds" ] && cp -r "$seeds"/. "$work"/
+  echo "-- $name"
+  "$target" -max_total_time="$FUZZ_SECONDS" -timeout=10 -rss_limit_mb=2048 \
+    -print_final_stats=1 "$work" 2>&1 | tail -n 12
+  rm -rf "$work"
+done
+
+if [ -x scripts/test-java.sh ]; then
+  step "JVM tests"
+  bash scripts/test-java.sh build
+fi
+if [ -x scripts/test-crosscheck.sh ]; then
+  step "cross-check against the trainer"
+  bash scripts/test-crosscheck.sh build
+fi
+step "all tests passed"
