@@ -1,0 +1,55 @@
+// The Java VM and the JNI environment of the calling thread.
+//
+// `kestrova::xplat::initialize` is called from a library's JNI_OnLoad: it
+// remembers the VM for the life of the process and runs the library's
+// registration callback once. Native methods construct a `ThreadScope` from
+// the JNIEnv* they received; while it lives, `Environment::current()` returns
+// that environment on this thread. Outside any scope the environment is asked
+// from the VM, which works for every thread the VM knows.
+//
+// Thread-safety: all functions may be called from any thread. ThreadScope is
+// bound to the thread that created it and must be destroyed on it.
+#pragma once
+
+#include <jni.h>
+
+#include "host/jni/Api.h"
+
+namespace kestrova::xplat {
+
+// Remembers `vm`, runs `registerNatives` once with the VM's environment
+// current, and returns JNI_VERSION_1_6. If the callback throws, the failure is
+// left pending as a Java exception and JNI_ERR is returned, so that the Java
+// call loading the library fails with that exception.
+KESTROVA_JNI_API jint initialize(JavaVM* vm, void (*registerNatives)());
+
+}  // namespace kestrova::xplat
+
+namespace kestrova::jni {
+
+class KESTROVA_JNI_API Environment {
+ public:
+  // The JNIEnv* of the calling thread. Throws std::runtime_error when the
+  // layer was never initialised or the thread is unknown to the VM.
+  static JNIEnv* current();
+
+  // As current(), but nullptr instead of throwing. For destructors.
+  static JNIEnv* currentOrNull() noexcept;
+
+  // The VM given to initialize(), or nullptr.
+  static JavaVM* vm() noexcept;
+};
+
+class KESTROVA_JNI_API ThreadScope {
+ public:
+  explicit ThreadScope(JNIEnv* env) noexcept;
+  ~ThreadScope();
+
+  ThreadScope(const ThreadScope&) = delete;
+  ThreadScope& operator=(const ThreadScope&) = delete;
+
+ private:
+  JNIEnv* previous_;
+};
+
+}  // namespace kestrova::jni

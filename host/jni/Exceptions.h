@@ -1,0 +1,85 @@
+// Crossing between Java exceptions and C++ exceptions.
+//
+// Native code that calls into the VM turns a pending Java exception into a
+// C++ `JniException` (which keeps the Java throwable alive through a global
+// reference) and lets it unwind like any other exception. At the boundary back
+// to Java, `translatePendingCppExceptionToJavaException()` (called inside a
+// catch handler) makes the matching Java exception pending:
+//
+//   JniException            the carried Java throwable itself
+//   std::bad_alloc          java.lang.OutOfMemoryError
+//   std::out_of_range       java.lang.IndexOutOfBoundsException
+//   std::invalid_argument   java.lang.IllegalArgumentException
+//   other std::exception    com.kestrova.jni.CppException
+//   anything else           com.kestrova.jni.CppException "unknown native exception"
+//
+// The message of a translated exception is what() of the C++ exception.
+// Everything here uses the calling thread's environment (Environment::current).
+#pragma once
+
+#include <jni.h>
+
+#include <cstdio>
+#include <exception>
+#include <memory>
+#include <string>
+
+#include "host/jni/Api.h"
+
+namespace kestrova::jni {
+
+class KESTROVA_JNI_API JniException : public std::exception {
+ public:
+  // Keeps `throwable` (any kind of reference) through a new global reference.
+  explicit JniException(jthrowable throwable);
+  ~JniException() override;
+
+  // "<class name>: <message>" of the carried throwable.
+  const char* what() const noexcept override;
+
+  // The carried throwable (a global reference owned by this object).
+  jthrowable getThrowable() const noexcept;
+
+ private:
+  std::shared_ptr<_jobject> throwable_;
+  std::string what_;
+};
+
+// When `failed`, raises the pending Java exception as a JniException (a
+// std::runtime_error when nothing is pending).
+KESTROVA_JNI_API void throwCppExceptionIf(bool failed);
+
+// If a Java exception is pending, clears it and throws it as a JniException.
+KESTROVA_JNI_API void throwPendingJniExceptionAsCppException();
+
+// Throws a JniException carrying a new Java exception of class
+// `throwableName` (slash form) with `message` (UTF-8).
+[[noreturn]] KESTROVA_JNI_API void throwNewJavaException(const char* throwableName,
+                                                         const char* message);
+
+// As above with a printf-style message; at least one argument is required.
+template <typename Arg, typename... Args>
+[[noreturn]] void throwNewJavaException(const char* throwableName, const char* format,
+                                        Arg arg, Args... args) {
+  int length = std::snprintf(nullptr, 0, format, arg, args...);
+  std::string message(length > 0 ? static_cast<size_t>(length) : 0, '\0');
+  if (length > 0) {
+    std::snprintf(message.data(), message.size() + 1, format, arg, args...);
+  }
+  throwNewJavaException(throwableName, message.c_str());
+}
+
+// To be called inside a catch handler: makes the Java exception that matches
+// the exception being handled pending on the current thread (table above).
+// Never throws; if even that fails, the VM's own error stays pending.
+KESTROVA_JNI_API void translatePendingCppExceptionToJavaException() noexcept;
+
+}  // namespace kestrova::jni
+
+namespace kestrova {
+
+// Writes the printf-style diagnostic through the fatal log and aborts.
+[[noreturn]] KESTROVA_JNI_API void assertInternal(const char* format, ...)
+    __attribute__((format(printf, 1, 2)));
+
+}  // namespace kestrova
