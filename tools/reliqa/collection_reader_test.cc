@@ -1,0 +1,110 @@
+#include "tools/reliqa/collection_reader.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "tools/reliqa/errors.h"
+
+namespace reliqa::tool {
+namespace {
+
+using ::testing::HasSubstr;
+
+const char* kAsset = R"({"assetID": "a1", "assetType": "photo",
+ "creationDateSinceEpoch": 4102444800, "modificationDateSinceEpoch": -1,
+ "pixelWidth": 4032, "pixelHeight": 3024.5, "latitude": 38.7, "longitude": -9.1,
+ "videoDuration": 0, "isFavorite": 1, "isHidden": 0, "mediaSubtypes": 10, "sourceType": 2,
+ "blurrinessMetric": {"isCalculated": true, "value": 0.25},
+ "darknessMetric": {"isCalculated": false, "value": 0}})";
+
+std::string collection(const std::string& assets, const std::string& location = "null",
+                       const std::string& counts = "null") {
+  return R"({"collectionID": "c", "timeSinceStory": 12.5, "locationInfo": )" + location +
+         R"(, "assetCounts": )" + counts + R"(, "assetDetails": [)" + assets +
+         R"(], "duplicateInfos": [{"assetIdA": "a1", "assetIdB": "a2", "dupeCoefficient": 0.93}]})";
+}
+
+// The message of the ToolError that parsing `json` throws.
+std::string errorOf(const std::string& json, int64_t firstLine = 1) {
+  try {
+    parseCollection(json, "f.json", firstLine);
+  } catch (const ToolError& e) {
+    return e.describe();
+  }
+  return "no error";
+}
+
+TEST(CollectionReader, ReadsEveryField) {
+  auto in = parseCollection(collection(kAsset, R"({"name": "Sintra", "isLandmark": true, "longitude": -9.39,
+      "latitude": 38.8})", R"({"tileCount": 1, "totalAssetsCount": 2, "photosCount": 3, "burstCount": 4,
+      "videosCount": 5, "loopsCount": 6, "totalAssetsWithinBurstsCount": 7, "totalAssetsWithinLoopsCount": 8,
+      "facesCount": 9, "photosWithFacesCount": 10})"),
+                            "f.json");
+  EXPECT_EQ(in.collectionID, "c");
+  EXPECT_EQ(in.timeSinceStory, 12.5);
+  ASSERT_TRUE(in.locationInfo.has_value());
+  EXPECT_EQ(in.locationInfo->name, "Sintra");
+  EXPECT_TRUE(in.locationInfo->isLandmark);
+  EXPECT_EQ(in.locationInfo->latitude, 38.8);
+  EXPECT_EQ(in.assetCounts.videosCount, 5);  // order of the counts is binding
+  EXPECT_EQ(in.assetCounts.loopsCount, 6);
+  EXPECT_EQ(in.assetCounts.photosWithFacesCount, 10);
+  ASSERT_EQ(in.assetDetails.size(), 1u);
+  const auto& a = in.assetDetails[0];
+  EXPECT_EQ(a.creationDateSinceEpoch, time_t{4102444800});  // beyond 2038: 64-bit dates
+  EXPECT_EQ(a.modificationDateSinceEpoch, time_t{-1});
+  EXPECT_EQ(a.pixelWidth, 4032.0);
+  EXPECT_EQ(a.pixelHeight, 3024.5);
+  EXPECT_EQ(a.longitude, -9.1);
+  EXPECT_EQ(a.mediaSubtypes, 10);
+  EXPECT_EQ(a.sourceType, 2);
+  EXPECT_TRUE(a.blurrinessMetric.isCalculated);
+  EXPECT_EQ(a.blurrinessMetric.value, 0.25);
+  EXPECT_FALSE(a.darknessMetric.isCalculated);
+  ASSERT_EQ(in.duplicateInfos.size(), 1u);
+  EXPECT_EQ(in.duplicateInfos[0].assetIdB, "a2");
+  EXPECT_EQ(in.duplicateInfos[0].dupeCoefficient, 0.93);
+}
+
+TEST(CollectionReader, NullLocationAndCountsMeanAbsentAndZero) {
+  auto in = parseCollection(collection(""), "f.json");
+  EXPECT_FALSE(in.locationInfo.has_value());
+  EXPECT_EQ(in.assetCounts.totalAssetsCount, 0);
+  EXPECT_TRUE(in.assetDetails.empty());
+}
+
+TEST(CollectionReader, TypeErrorsNameTheMemberAndItsLine) {
+  std::string bad = collection(std::string(kAsset).replace(std::string(kAsset).find("4032"), 4, "\"wide\""));
+  EXPECT_THAT(errorOf(bad), HasSubstr("f.json:3: assetDetails[0].pixelWidth: expected a number, got a string"));
+  // A JSON Lines stream places the message on the line of the collection.
+  EXPECT_THAT(errorOf(R"({"collectionID": 7})", 41), HasSubstr("f.json:41: collectionID: expected a string"));
+  std::string fraction = collection(std::string(kAsset).replace(std::string(kAsset).find("-1"), 2, "-1.5"));
+  EXPECT_THAT(errorOf(fraction), HasSubstr("modificationDateSinceEpoch: expected an integer, got -1.5"));
+  std::string wide = collection(std::string(kAsset).replace(std::string(kAsset).find("\"isFavorite\": 1"), 15,
+                                                             "\"isFavorite\": 3000000000"));
+  EXPECT_THAT(errorOf(wide), HasSubstr("isFavorite: integer 3000000000 is out of range"));
+  EXPECT_THAT(errorOf(collection("", "true")), HasSubstr("locationInfo: expected an object, got a boolean"));
+  EXPECT_THAT(errorOf("[1, 2]"), HasSubstr("f.json:1: expected a collection (a JSON object), got an array"));
+}
+
+TEST(CollectionReader, MembersMustBeKnownPresentAndUnique) {
+  std::string c = collection("");
+  EXPECT_THAT(errorOf(R"({"collectionId": "x"})"), HasSubstr("unknown member \"collectionId\""));
+  EXPECT_THAT(errorOf(c.substr(0, c.size() - 1) + R"(, "timeSinceStory": 1})"),
+              HasSubstr("member timeSinceStory appears twice"));
+  std::string noDupes = c.substr(0, c.find(", \"duplicateInfos\"")) + "}";
+  EXPECT_THAT(errorOf(noDupes), HasSubstr("missing member duplicateInfos"));
+  EXPECT_THAT(errorOf(collection(R"({"assetID": "a"})")), HasSubstr("missing member assetDetails[0].assetType"));
+}
+
+TEST(CollectionReader, MalformedJsonIsAnErrorWithAPosition) {
+  std::string c = collection(kAsset);
+  EXPECT_THAT(errorOf(c + "\n\n  x"), HasSubstr("f.json:8: unexpected text after the end"));
+  EXPECT_THAT(errorOf(c.substr(0, c.size() / 2)), HasSubstr("f.json:"));
+  EXPECT_THAT(errorOf(""), HasSubstr("f.json:1: "));
+  EXPECT_THAT(errorOf("{\"collectionID\": \"\xff\"}"), HasSubstr("UTF-8"));
+  EXPECT_THAT(errorOf(std::string(5000, '[') + std::string(5000, ']')), HasSubstr("f.json:1: "));
+}
+
+}  // namespace
+}  // namespace reliqa::tool

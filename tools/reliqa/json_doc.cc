@@ -1,0 +1,250 @@
+#include "tools/reliqa/json_doc.h"
+
+#include <algorithm>
+#include <vector>
+
+#include "tools/reliqa/errors.h"
+
+namespace reliqa::tool {
+
+using simdjson::ondemand::json_type;
+using simdjson::ondemand::number_type;
+
+namespace {
+
+const char* typeWord(json_type t) {
+  switch (t) {
+    case json_type::array: return "an array";
+    case json_type::object: return "an object";
+    case json_type::number: return "a number";
+    case json_type::string: return "a string";
+    case json_type::boolean: return "a boolean";
+    case json_type::null: return "null";
+  }
+  return "an unknown value";
+}
+
+std::string where(const std::string& path) { return path.empty() ? std::string() : path + ": "; }
+
+}  // namespace
+
+std::string quoteForMessage(std::string_view s) {
+  static const char* hex = "0123456789abcdef";
+  std::string out = "\"";
+  size_t n = std::min<size_t>(s.size(), 60);
+  for (size_t i = 0; i < n; ++i) {
+    unsigned char c = static_cast<unsigned char>(s[i]);
+    if (c == '"' || c == '\\') {
+      out += '\\';
+      out += static_cast<char>(c);
+    } else if (c < 0x20 || c == 0x7f) {
+      out += "\\x";
+      out += hex[c >> 4];
+      out += hex[c & 15];
+    } else {
+      out += static_cast<char>(c);
+    }
+  }
+  if (n < s.size()) out += "...";
+  return out + "\"";
+}
+
+JsonDoc::JsonDoc(std::string_view text, std::string name, int64_t firstLine)
+    : name_(std::move(name)), firstLine_(firstLine), text_(text.data(), text.size()) {}
+
+int64_t JsonDoc::lineOf(const char* at) const {
+  const char* begin = text_.data();
+  const char* end = begin + text_.size();
+  if (at == nullptr || at < begin) at = begin;
+  if (at > end) at = end;
+  return firstLine_ + std::count(begin, at, '\n');
+}
+
+void JsonDoc::fail(const char* at, const std::string& message) const {
+  throw ToolError(name_, lineOf(at), message);
+}
+
+void JsonDoc::failSyntax(simdjson::error_code code, const std::string& path) {
+  const char* at = text_.data() + text_.size();
+  if (iterated_) {
+    const char* loc = nullptr;
+    if (!doc_.current_location().get(loc)) at = loc;
+  }
+  std::string what;
+  switch (code) {
+    case simdjson::EMPTY: what = "no JSON value (the input is empty)"; break;
+    case simdjson::DEPTH_ERROR: what = "JSON nested too deeply"; break;
+    case simdjson::UTF8_ERROR: what = "invalid UTF-8 in the JSON text"; break;
+    case simdjson::UNCLOSED_STRING: what = "unterminated string"; break;
+    case simdjson::CAPACITY: what = "JSON text too large"; break;
+    default: what = std::string("malformed JSON (") + simdjson::error_message(code) + ")"; break;
+  }
+  fail(at, where(path) + what);
+}
+
+void JsonDoc::scanStructure() {
+  // simdjson reports some structural problems far from where they are (or not
+  // at all, for text after the root value), so the brackets, strings and what
+  // follows the root value are checked here first.
+  const char* p = text_.data();
+  const char* end = p + text_.size();
+  auto space = [](char c) { return c == ' ' || c == '\n' || c == '\r' || c == '\t'; };
+  while (p < end && space(*p)) ++p;
+  if (p == end) fail(p, "no JSON value (the input is empty)");
+  std::vector<const char*> open;  // positions of the open brackets
+  do {
+    char c = *p;
+    if (c == '"') {
+      const char* start = p++;
+      while (p < end && *p != '"') p += *p == '\\' ? 2 : 1;
+      if (p >= end) fail(start, "unterminated string");
+    } else if (c == '{' || c == '[') {
+      open.push_back(p);
+    } else if (c == '}' || c == ']') {
+      if (open.empty() || (*open.back() == '{') != (c == '}')) {
+        fail(p, std::string("unexpected '") + c + "'");
+      }
+      open.pop_back();
+    }
+    ++p;
+  } while (p < end && !open.empty());
+  if (!open.empty()) {
+    fail(end, std::string("the JSON text ends inside ") + (*open.back() == '{' ? "an object" : "an array") +
+                  " opened on line " + std::to_string(lineOf(open.back())));
+  }
+  while (p < end && space(*p)) ++p;
+  if (p < end) fail(p, "unexpected text after the end of the JSON value");
+}
+
+simdjson::ondemand::object JsonDoc::rootObject(const std::string& what) {
+  scanStructure();
+  if (auto err = parser_.iterate(text_).get(doc_)) failSyntax(err, "");
+  iterated_ = true;
+  json_type t;
+  if (auto err = doc_.type().get(t)) failSyntax(err, "");
+  if (t != json_type::object) {
+    const char* at = nullptr;
+    if (doc_.current_location().get(at)) at = text_.data();
+    fail(at, "expected " + what + " (a JSON object), got " + typeWord(t));
+  }
+  simdjson::ondemand::object obj;
+  if (auto err = doc_.get_object().get(obj)) failSyntax(err, "");
+  return obj;
+}
+
+void JsonDoc::expectEnd() {
+  // The iterator stands after the root value; any token left is surplus.
+  const char* at = nullptr;
+  if (!doc_.current_location().get(at)) fail(at, "unexpected text after the end of the JSON value");
+}
+
+std::string JsonDoc::typeName(simdjson::ondemand::value& v, const std::string& path) {
+  json_type t;
+  if (auto err = v.type().get(t)) failSyntax(err, path);
+  return typeWord(t);
+}
+
+namespace {
+json_type typeOf(JsonDoc& doc, simdjson::ondemand::value& v, const std::string& path) {
+  json_type t;
+  if (auto err = v.type().get(t)) doc.failSyntax(err, path);
+  return t;
+}
+}  // namespace
+
+simdjson::ondemand::object JsonDoc::getObject(simdjson::ondemand::value& v, const std::string& path) {
+  json_type t = typeOf(*this, v, path);
+  if (t != json_type::object) fail(v, where(path) + "expected an object, got " + typeWord(t));
+  return take(v.get_object(), path);
+}
+
+simdjson::ondemand::array JsonDoc::getArray(simdjson::ondemand::value& v, const std::string& path) {
+  json_type t = typeOf(*this, v, path);
+  if (t != json_type::array) fail(v, where(path) + "expected an array, got " + typeWord(t));
+  return take(v.get_array(), path);
+}
+
+double JsonDoc::getDouble(simdjson::ondemand::value& v, const std::string& path) {
+  json_type t = typeOf(*this, v, path);
+  if (t != json_type::number) fail(v, where(path) + "expected a number, got " + typeWord(t));
+  double d;
+  if (auto err = v.get_double().get(d)) {
+    if (err == simdjson::NUMBER_ERROR || err == simdjson::INCORRECT_TYPE) {
+      fail(v, where(path) + "malformed number " + quoteForMessage(v.raw_json_token()));
+    }
+    failSyntax(err, path);
+  }
+  return d;
+}
+
+int64_t JsonDoc::getInt(simdjson::ondemand::value& v, const std::string& path, int64_t min, int64_t max) {
+  json_type t = typeOf(*this, v, path);
+  if (t != json_type::number) fail(v, where(path) + "expected an integer, got " + typeWord(t));
+  std::string token(v.raw_json_token());
+  while (!token.empty() && (token.back() == ' ' || token.back() == '\n' || token.back() == '\r' ||
+                            token.back() == '\t')) {
+    token.pop_back();
+  }
+  number_type nt;
+  if (v.get_number_type().get(nt) || nt == number_type::floating_point_number) {
+    fail(v, where(path) + "expected an integer, got " + token);
+  }
+  int64_t out = 0;
+  if (nt == number_type::unsigned_integer || v.get_int64().get(out) || out < min || out > max) {
+    fail(v, where(path) + "integer " + token + " is out of range [" + std::to_string(min) + ", " +
+                std::to_string(max) + "]");
+  }
+  return out;
+}
+
+bool JsonDoc::getBool(simdjson::ondemand::value& v, const std::string& path) {
+  json_type t = typeOf(*this, v, path);
+  if (t != json_type::boolean) fail(v, where(path) + "expected true or false, got " + typeWord(t));
+  return take(v.get_bool(), path);
+}
+
+std::string JsonDoc::getString(simdjson::ondemand::value& v, const std::string& path) {
+  json_type t = typeOf(*this, v, path);
+  if (t != json_type::string) fail(v, where(path) + "expected a string, got " + typeWord(t));
+  std::string_view s;
+  if (auto err = v.get_string().get(s)) {
+    fail(v, where(path) + "malformed string (" + simdjson::error_message(err) + ")");
+  }
+  return std::string(s);
+}
+
+bool JsonDoc::isNull(simdjson::ondemand::value& v, const std::string& path) {
+  if (typeOf(*this, v, path) != json_type::null) return false;
+  bool null = false;
+  if (v.is_null().get(null) || !null) fail(v, where(path) + "malformed literal (expected null)");
+  return true;
+}
+
+MemberSet::MemberSet(std::string path, std::initializer_list<const char*> names)
+    : path_(std::move(path)), names_(names), seen_(names.size(), false) {}
+
+std::string MemberSet::pathOf(std::string_view key) const {
+  return path_.empty() ? std::string(key) : path_ + "." + std::string(key);
+}
+
+size_t MemberSet::accept(JsonDoc& doc, std::string_view key, simdjson::ondemand::value& v) {
+  for (size_t i = 0; i < names_.size(); ++i) {
+    if (key == names_[i]) {
+      if (seen_[i]) doc.fail(v, "member " + pathOf(key) + " appears twice");
+      seen_[i] = true;
+      return i;
+    }
+  }
+  std::string in = path_.empty() ? std::string() : " in " + path_;
+  std::string known;
+  for (const char* n : names_) known += std::string(known.empty() ? "" : ", ") + n;
+  doc.fail(v, "unknown member " + quoteForMessage(key) + in + " (expected: " + known + ")");
+}
+
+void MemberSet::requireAll(JsonDoc& doc, const char* at) const {
+  for (size_t i = 0; i < names_.size(); ++i) {
+    if (!seen_[i]) doc.fail(at, "missing member " + pathOf(names_[i]));
+  }
+}
+
+}  // namespace reliqa::tool
