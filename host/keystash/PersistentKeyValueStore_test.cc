@@ -1,0 +1,111 @@
+#include "host/keystash/PersistentKeyValueStore.h"
+
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "host/keystash/TemporaryDirectory.h"
+
+namespace kestrova::mobile::xplat::keystash {
+namespace {
+
+using FileUtils::BinaryData;
+
+std::optional<std::string> read(PersistentKeyValueStore& store, const std::string& key) {
+  auto entry = store.fetch(key, std::nullopt).get();
+  if (!entry) return std::nullopt;
+  return entry->data.toString();
+}
+
+void write(PersistentKeyValueStore& store, const std::string& key, const std::string& value) {
+  store.store(key, BinaryData(value), BinaryData()).get();
+}
+
+TEST(PersistentKeyValueStoreTest, StoresBytesExactlyAndLastWriteWins) {
+  TemporaryDirectory dir;
+  PersistentKeyValueStore store(dir.file("kv.db"));
+  EXPECT_EQ(read(store, "absent"), std::nullopt);
+
+  const std::string binary("line\n\0\xff\xc3\xa9 end", 12);
+  write(store, "k", binary);
+  EXPECT_EQ(read(store, "k"), binary);
+  write(store, "k", "");
+  EXPECT_EQ(read(store, "k"), std::string());  // stored empty, not absent
+  write(store, "k", "second");
+  EXPECT_EQ(read(store, "k"), "second");
+
+  store.store("with-extra", BinaryData(std::string("v")), BinaryData(std::string("x"))).get();
+  auto entry = store.fetch("with-extra", std::nullopt).get();
+  ASSERT_TRUE(entry);
+  EXPECT_EQ(entry->extra, "x");
+  EXPECT_EQ(read(store, std::string("k\0", 2)), std::nullopt);  // keys are byte strings too
+}
+
+TEST(PersistentKeyValueStoreTest, ValuesSurviveNewObjectsAndAKilledProcess) {
+  TemporaryDirectory dir;
+  const std::string path = dir.file("kv.db");
+  {
+    PersistentKeyValueStore store(path);
+    write(store, "before", "1");
+  }
+  pid_t child = fork();
+  ASSERT_GE(child, 0);
+  if (child == 0) {
+    // The write has completed when get() returns; die without any clean-up.
+    PersistentKeyValueStore store(path);
+    write(store, "from-child", "written then killed");
+    raise(SIGKILL);
+    _exit(1);
+  }
+  int status = 0;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  ASSERT_TRUE(WIFSIGNALED(status));
+
+  PersistentKeyValueStore reopened(path);
+  EXPECT_EQ(read(reopened, "before"), "1");
+  EXPECT_EQ(read(reopened, "from-child"), "written then killed");
+}
+
+TEST(PersistentKeyValueStoreTest, ConcurrentWritersNeverTearAValue) {
+  TemporaryDirectory dir;
+  PersistentKeyValueStore first(dir.file("kv.db"));
+  PersistentKeyValueStore second(dir.file("kv.db"));  // another connection to the same file
+  std::atomic<bool> torn{false};
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 4; ++t) {
+    threads.emplace_back([&, t] {
+      PersistentKeyValueStore& store = t % 2 ? first : second;
+      for (int i = 0; i < 50; ++i) {
+        // Each value is one repeated letter whose count encodes it.
+        write(store, "shared", std::string(1000 + 100 * t + i, static_cast<char>('a' + t)));
+        auto value = read(store, "shared");
+        if (!value || value->size() < 1000 ||
+            value->find_first_not_of(value->front()) != std::string::npos ||
+            (value->size() - 1000) / 100 != static_cast<size_t>(value->front() - 'a')) {
+          torn = true;
+        }
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  EXPECT_FALSE(torn);
+}
+
+TEST(PersistentKeyValueStoreTest, UnopenableDatabaseThrowsWithThePath) {
+  TemporaryDirectory dir;
+  try {
+    PersistentKeyValueStore store(dir.file("missing/dir/kv.db"));
+    FAIL() << "expected an exception";
+  } catch (const std::runtime_error& error) {
+    EXPECT_NE(std::string(error.what()).find("missing/dir/kv.db"), std::string::npos) << error.what();
+  }
+}
+
+}  // namespace
+}  // namespace kestrova::mobile::xplat::keystash

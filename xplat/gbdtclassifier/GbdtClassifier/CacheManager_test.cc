@@ -1,0 +1,118 @@
+#include "xplat/gbdtclassifier/GbdtClassifier/CacheManager.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <limits>
+
+#include "host/keystash/FakePersistentKeyValueStore.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/TestLogSink.h"
+
+namespace thornvale {
+namespace {
+
+using kestrova::mobile::xplat::keystash::FakePersistentKeyValueStore;
+using kestrova::mobile::xplat::keystash::FutureError;
+using Failure = FakePersistentKeyValueStore::Failure;
+using ::testing::ElementsAre;
+
+class CacheManagerTest : public ::testing::Test {
+ protected:
+  std::shared_ptr<FakePersistentKeyValueStore> store = std::make_shared<FakePersistentKeyValueStore>();
+  CacheManager cache{store, "RELIQA"};
+  TestLogSink log;
+};
+
+TEST_F(CacheManagerTest, EncodesEachTypeUnderThePrefixedKey) {
+  EXPECT_EQ(cache.makeKey("server_features"), "RELIQA_server_features");
+
+  cache.store("threshold", 0.5);
+  cache.store("one", 1.0);
+  cache.store("model", std::string("line1\nline2\0\xff", 13));
+  cache.store("server_features", FeatureMap{{4, 9.0}});
+  EXPECT_EQ(store->peek("RELIQA_threshold"), "0.5");
+  EXPECT_EQ(store->peek("RELIQA_one"), "1");
+  EXPECT_EQ(store->peek("RELIQA_model"), std::string("line1\nline2\0\xff", 13));
+  EXPECT_EQ(store->peek("RELIQA_server_features"), "{\"4\":9}");
+
+  EXPECT_EQ(cache.fetch("threshold", 0.0), 0.5);
+  EXPECT_EQ(cache.fetch("model", ""), std::string("line1\nline2\0\xff", 13));
+  EXPECT_EQ(cache.fetch("server_features", FeatureMap{}), (FeatureMap{{4, 9.0}}));
+
+  // Absent keys give the defaults, silently.
+  EXPECT_EQ(cache.fetch("absent", 0.25), 0.25);
+  EXPECT_EQ(cache.fetch("absent", "dflt"), "dflt");
+  EXPECT_EQ(cache.fetch("absent", FeatureMap{{1, 1.0}}), (FeatureMap{{1, 1.0}}));
+  EXPECT_TRUE(log.lines().empty());
+}
+
+TEST_F(CacheManagerTest, UndecodableValuesThrowInsteadOfDefaultingAndLogNothing) {
+  store->put("RELIQA_threshold", "abc");
+  EXPECT_THROW(cache.fetch("threshold", 0.0), ConversionError);
+  store->put("RELIQA_threshold", " 0.7\n");
+  EXPECT_EQ(cache.fetch("threshold", 0.0), 0.7);
+  store->put("RELIQA_server_features", "[1]");
+  EXPECT_THROW(cache.fetch("server_features", FeatureMap{}), JsonTypeError);
+  store->put("RELIQA_server_features", "{\"4\":");
+  EXPECT_THROW(cache.fetch("server_features", FeatureMap{}), JsonParseError);
+  EXPECT_TRUE(log.lines().empty());
+}
+
+TEST_F(CacheManagerTest, NonFiniteNumbersAreRefusedBeforeTheStoreIsCalled) {
+  cache.store("threshold", 0.5);
+  int stores = store->storeCount();
+  EXPECT_THROW(cache.store("threshold", std::nan("")), JsonPrintError);
+  EXPECT_THROW(cache.store("server_features", FeatureMap{{1, -std::numeric_limits<double>::infinity()}}),
+               JsonPrintError);
+  EXPECT_EQ(store->storeCount(), stores);
+  EXPECT_EQ(store->peek("RELIQA_threshold"), "0.5");
+}
+
+TEST_F(CacheManagerTest, WithoutAStoreEveryCallLogsAndDefaults) {
+  CacheManager detached(nullptr, "RELIQA");
+  EXPECT_EQ(detached.fetch("model_id", "none"), "none");
+  detached.store("threshold", std::nan(""));  // nothing to store into: not even encoded
+  std::vector<TestLogSink::Line> lines = log.lines();
+  ASSERT_EQ(lines.size(), 2u);
+  EXPECT_EQ(lines[0].severity, google::GLOG_ERROR);
+  EXPECT_EQ(lines[0].message, "cache not initiated, tried to fetch: RELIQA_model_id");
+  EXPECT_EQ(lines[0].file + ":" + std::to_string(lines[0].line), "CacheManager.cc:105");
+  EXPECT_EQ(lines[1].severity, google::GLOG_ERROR);
+  EXPECT_EQ(lines[1].message, "cache not initiated, tried to store with key: RELIQA_threshold");
+  EXPECT_EQ(lines[1].file + ":" + std::to_string(lines[1].line), "CacheManager.cc:131");
+}
+
+TEST_F(CacheManagerTest, StoreFailuresAreLoggedAndAbsorbedWhereverTheyArise) {
+  store->put("RELIQA_threshold", "0.5");
+  for (Failure where : {Failure::kInCall, Failure::kInGet}) {
+    store->failFetches(where, std::make_exception_ptr(std::runtime_error("disk gone")));
+    store->failStores(where, std::make_exception_ptr(FutureError(FutureError::kNoValueSource)));
+    EXPECT_EQ(cache.fetch("threshold", 0.125), 0.125);
+    cache.store("threshold", 0.75);
+  }
+  store->failFetches(Failure::kNone);
+  EXPECT_EQ(cache.fetch("threshold", 0.0), 0.5);  // the failed stores changed nothing
+
+  EXPECT_THAT(log.messages(), ElementsAre("error fetching: RELIQA_threshold, exception: disk gone",
+                                          "error storing: RELIQA_threshold, exception: Unknown error",
+                                          "error fetching: RELIQA_threshold, exception: disk gone",
+                                          "error storing: RELIQA_threshold, exception: Unknown error"));
+  std::vector<TestLogSink::Line> lines = log.lines();
+  EXPECT_EQ(lines[0].line, 113);
+  EXPECT_EQ(lines[1].line, 140);
+  EXPECT_EQ(lines[0].severity, google::GLOG_ERROR);
+}
+
+TEST_F(CacheManagerTest, ExceptionsThatAreNotStdExceptionsPassThrough) {
+  store->failFetches(Failure::kInGet, std::make_exception_ptr(42));
+  EXPECT_THROW(cache.fetch("threshold", 0.0), int);
+  store->failStores(Failure::kInCall, std::make_exception_ptr(7));
+  EXPECT_THROW(cache.store("model", "m"), int);
+  EXPECT_TRUE(log.lines().empty());
+}
+
+}  // namespace
+}  // namespace thornvale

@@ -1,0 +1,33 @@
+// Number text: the one conversion between doubles and decimal text that every
+// stored value, logging value and JSON number of the system uses.
+//
+// doubleToText writes the shortest decimal that reads back to the same double:
+// no trailing ".0" ("1", "0.5", "-0"), positional for decimal exponents -6 to 20
+// and "<mantissa>E<exponent>" outside that span ("1E-7", "1E21"), and the words
+// "NaN", "Infinity" and "-Infinity" for non-finite values. It never fails.
+//
+// textToDouble and textToInt64 read numbers with the rules that stored values
+// were always read with: leading white space is skipped, trailing white space is
+// allowed, anything else after the number is an error. textToDouble also reads
+// "nan", "inf" and "infinity" (any case, optional "-") and returns +-Infinity or
+// 0 for out-of-range exponents. Both throw ConversionError.
+//
+// All functions are pure and may be called from any thread.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace thornvale {
+
+std::string doubleToText(double value);
+
+// Appends doubleToText(value) to `out`.
+void appendDoubleText(double value, std::string& out);
+
+double textToDouble(std::string_view text);
+
+int64_t textToInt64(std::string_view text);
+
+}  // namespace thornvale
