@@ -1,0 +1,258 @@
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
+
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <limits>
+#include <random>
+#include <sstream>
+
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+
+namespace thornvale {
+namespace {
+
+using testing::chain;
+using testing::leaf;
+using testing::split;
+
+const double kNaN = std::numeric_limits<double>::quiet_NaN();
+
+// f0 <= 1 ? 10 : (f1 <= 2 ? 20 : 30)
+std::unique_ptr<Tree> smallTree() {
+  return testing::tree(split(0, 1.0, leaf(10), split(1, 2.0, leaf(20), leaf(30))));
+}
+
+std::string rules(const Node& n) {
+  std::ostringstream out;
+  n.printRules(out);
+  return out.str();
+}
+
+TEST(TreeRouting, EqualGoesLeftGreaterAndNaNGoRight) {
+  auto t = smallTree();
+  const Node& root = *t->root;
+  EXPECT_EQ(root.evaluate({1.0, 0.0}), 10);
+  EXPECT_EQ(root.evaluate({std::nextafter(1.0, 2.0), 2.0}), 20);
+  EXPECT_EQ(root.evaluate({5.0, 2.5}), 30);
+  EXPECT_EQ(root.evaluate({kNaN, 0.0}), 20);  // NaN right at f0, then left at f1
+  EXPECT_EQ(root.evaluate({kNaN, kNaN}), 30);
+  EXPECT_EQ(root.findLeaf({5.0, kNaN}),
+            static_cast<const LinearNode&>(*static_cast<const LinearNode&>(root).right).right.get());
+
+  auto nanPivot = split(0, kNaN, leaf(1), leaf(2));
+  EXPECT_EQ(nanPivot->evaluate({-1e300}), 2);
+}
+
+TEST(TreeRouting, SingleLeafTree) {
+  auto only = leaf(4.5);
+  EXPECT_EQ(only->evaluate({}), 4.5);
+  EXPECT_EQ(only->findLeaf({}), only.get());
+  std::vector<const Node*> leaves;
+  only->collectLeaves(leaves);
+  ASSERT_EQ(leaves.size(), 1u);
+  EXPECT_EQ(rules(*only), "4.5\t\n");
+}
+
+TEST(TreeSweep, MatchesOneEvaluationPerValue) {
+  std::mt19937_64 rng(7);
+  for (int round = 0; round < 20; ++round) {
+    auto root = testing::randomFullTree(rng, 5, 3);
+    std::uniform_real_distribution<double> u(-1.5, 1.5);
+    std::vector<double> features{u(rng), u(rng), u(rng)};
+    std::vector<double> values;
+    for (int i = 0; i < 40; ++i) values.push_back(u(rng));
+    // Exact pivots and duplicates exercise the "not greater" boundary.
+    auto* top = static_cast<const LinearNode*>(root.get());
+    values.push_back(top->pivotValue);
+    values.push_back(top->pivotValue);
+    std::sort(values.begin(), values.end());
+    const int32_t swept = round % 3;
+
+    std::vector<double> out(values.size(), 1.0);
+    root->accumulateSweep(0.5, features, swept, static_cast<int32_t>(values.size()),
+                          values.data(), out.data());
+    root->accumulateSweep(2.0, features, swept, static_cast<int32_t>(values.size()),
+                          values.data(), out.data());
+    for (size_t i = 0; i < values.size(); ++i) {
+      std::vector<double> f = features;
+      f[swept] = values[i];
+      const double v = root->evaluate(f);
+      EXPECT_EQ(out[i], 1.0 + 0.5 * v + 2.0 * v) << "round " << round << " value " << i;
+    }
+  }
+}
+
+TEST(TreeSweep, ZeroCountAndOneSidedRanges) {
+  auto root = split(0, 1.0, leaf(1), leaf(2));
+  double out[3] = {0, 0, 0};
+  const double none[1] = {0};
+  root->accumulateSweep(1.0, {0}, 0, 0, none, out);
+  EXPECT_EQ(out[0], 0);
+
+  const double low[3] = {-1, 0, 1};  // all not greater than the pivot
+  root->accumulateSweep(1.0, {0}, 0, 3, low, out);
+  EXPECT_EQ(std::vector<double>(out, out + 3), (std::vector<double>{1, 1, 1}));
+  const double high[3] = {1.5, 2, 3};
+  root->accumulateSweep(1.0, {0}, 0, 3, high, out);
+  EXPECT_EQ(std::vector<double>(out, out + 3), (std::vector<double>{3, 3, 3}));
+}
+
+TEST(TreePrinting, PrintTreeIndentsByDepthAndNamesFeatures) {
+  auto t = smallTree();
+  linkTree(*t, {"size", ""});  // an empty name falls back to the index
+  std::ostringstream out;
+  t->root->printTree(out, 0);
+  EXPECT_EQ(out.str(),
+            "If size <= 1 then\n"
+            "\tFinal value = 10\n"
+            "If size > 1 then\n"
+            "\tIf 1 <= 2 then\n"
+            "\t\tFinal value = 20\n"
+            "\tIf 1 > 2 then\n"
+            "\t\tFinal value = 30\n");
+  std::ostringstream nested;
+  t->root->printTree(nested, 1);
+  EXPECT_EQ(nested.str().substr(0, 20), "\tIf size <= 1 then\n\t");
+}
+
+TEST(TreePrinting, PrintWritesOneLineDescriptions) {
+  ::testing::internal::CaptureStdout();
+  leaf(0.5)->print();
+  split(7, -2.25, leaf(0), leaf(1))->print();
+  EXPECT_EQ(::testing::internal::GetCapturedStdout(),
+            "ConstantNode: value = 0.500000"
+            "LinearNode: pivot index = 7, pivot value = -2.250000");
+}
+
+TEST(TreePrinting, RulesOrderedByValueWithAllBoundForms) {
+  // f0 <= 1 ? 0.2 : (f0 <= 4 ? (f2 <= -3 ? 0.9 : 0.5) : 0.7)
+  auto t = testing::tree(split(0, 1.0, leaf(0.2),
+                               split(0, 4.0, split(2, -3.0, leaf(0.9), leaf(0.5)), leaf(0.7))));
+  linkTree(*t, {"a", "b", "c"});
+  EXPECT_EQ(rules(*t->root),
+            "0.9\t1 < a <= 4; c <= -3; \n"
+            "0.7\t4 < a; \n"
+            "0.5\t1 < a <= 4; -3 < c; \n"
+            "0.2\ta <= 1; \n");
+
+  // Going left at 4 and then at 2 keeps the tighter upper bound; a right
+  // branch at a zero or negative pivot still prints its lower bound.
+  auto u = testing::tree(
+      split(0, 4.0, split(0, 2.0, leaf(1), leaf(2)), split(1, -0.5, leaf(3), leaf(4))));
+  linkTree(*u, {});
+  EXPECT_EQ(rules(*u->root), "4\t4 < 0; -0.5 < 1; \n3\t4 < 0; 1 <= -0.5; \n2\t2 < 0 <= 4; \n1\t0 <= 2; \n");
+}
+
+// The root's printRules (one depth-first pass) must write exactly what the
+// leaves' own printRules (a walk up the parent links each) write, in the same
+// order, also for NaN and signed-zero pivots where the bound folds depend on
+// order.
+TEST(TreePrinting, RulesOfRootMatchRulesOfEachLeaf) {
+  std::mt19937_64 rng(11);
+  const double pivots[] = {kNaN, -kNaN, 0.0, -0.0, 1.0, -1.0, 0.5};
+  for (int round = 0; round < 30; ++round) {
+    auto t = testing::tree(testing::randomFullTree(rng, 6, 2));
+    std::vector<const Node*> leaves;
+    t->root->collectLeaves(leaves);
+    // Distinct leaf values make the order unambiguous; pivots from a small set
+    // make repeated, NaN and signed-zero bounds common.
+    std::vector<Node*> pending{t->root.get()};
+    double next = 0.0;
+    while (!pending.empty()) {
+      Node* n = pending.back();
+      pending.pop_back();
+      if (n->isLeaf()) {
+        static_cast<ConstantNode*>(n)->value = (next += 1.0);
+        continue;
+      }
+      auto* s = static_cast<LinearNode*>(n);
+      s->pivotValue = pivots[rng() % 7];
+      pending.push_back(s->left.get());
+      pending.push_back(s->right.get());
+    }
+    linkTree(*t, {"x", "y"});
+    std::ostringstream expected;
+    std::vector<const Node*> byValue = leaves;
+    std::sort(byValue.begin(), byValue.end(), [](const Node* a, const Node* b) {
+      return static_cast<const ConstantNode*>(a)->value > static_cast<const ConstantNode*>(b)->value;
+    });
+    for (const Node* l : byValue) l->printRules(expected);
+    ASSERT_EQ(rules(*t->root), expected.str()) << "round " << round;
+  }
+}
+
+TEST(TreeCopies, CloneIsDeepIndependentAndUnlinked) {
+  auto t = smallTree();
+  t->featureValues = {{3, 0.5}, {-1, 2.0}};
+  linkTree(*t, {"p", "q"});
+  Tree copy(*t);
+  std::string why;
+  EXPECT_TRUE(testing::sameNodes(t->root.get(), copy.root.get(), &why)) << why;
+  EXPECT_NE(copy.root.get(), t->root.get());
+  EXPECT_EQ(copy.root->tree, nullptr);
+  EXPECT_EQ(copy.featureValues, t->featureValues);
+  EXPECT_EQ(copy.featureNames, t->featureNames);
+  static_cast<LinearNode&>(*t->root).pivotValue = 100;
+  EXPECT_EQ(static_cast<LinearNode&>(*copy.root).pivotValue, 1.0);
+
+  Tree empty;
+  Tree emptyCopy(empty);
+  EXPECT_EQ(emptyCopy.root, nullptr);
+}
+
+TEST(TreeCopies, CollectLeavesLeftToRight) {
+  auto t = smallTree();
+  std::vector<const Node*> leaves;
+  t->root->collectLeaves(leaves);
+  ASSERT_EQ(leaves.size(), 3u);
+  EXPECT_EQ(leaves[0]->evaluate({}), 10);
+  EXPECT_EQ(leaves[1]->evaluate({}), 20);
+  EXPECT_EQ(leaves[2]->evaluate({}), 30);
+}
+
+// Every operation on a tree a million levels deep, on a 256 KiB stack.
+TEST(DeepTree, MillionLevelChainOnSmallStack) {
+  constexpr size_t kDepth = 1000000;
+  testing::runOnSmallStack([] {
+    auto t = testing::tree(chain(kDepth));
+    const std::vector<double> bottom{2e6};
+    EXPECT_EQ(t->root->evaluate(bottom), -1.0);
+    EXPECT_EQ(t->root->findLeaf({kDepth - 1.5})->evaluate({}), kDepth - 1.0);
+
+    Tree copy(*t);
+    EXPECT_EQ(copy.root->evaluate(bottom), -1.0);
+
+    std::vector<const Node*> leaves;
+    copy.root->collectLeaves(leaves);
+    EXPECT_EQ(leaves.size(), kDepth + 1);
+
+    const double values[3] = {-5.0, 10.5, 3e6};
+    double out[3] = {0, 0, 0};
+    t->root->accumulateSweep(2.0, {0.0}, 0, 3, values, out);
+    EXPECT_EQ(out[0], 0.0);
+    EXPECT_EQ(out[1], 22.0);
+    EXPECT_EQ(out[2], -2.0);
+
+    linkTree(*t, {"depth"});
+    std::ostringstream text;
+    t->root->printRules(text);
+    const std::string all = text.str();
+    EXPECT_EQ(std::count(all.begin(), all.end(), '\n'), static_cast<long>(kDepth + 1));
+    EXPECT_EQ(all.substr(0, all.find('\n')), "999999\t999998 < depth <= 999999; ");
+  });
+}
+
+TEST(DeepTree, PrintTreeOfDeepChainOnSmallStack) {
+  testing::runOnSmallStack([] {
+    auto t = testing::tree(chain(3000));
+    std::ostringstream text;
+    t->root->printTree(text, 0);
+    const std::string all = text.str();
+    EXPECT_EQ(std::count(all.begin(), all.end(), '\n'), 3 * 3000 + 1);
+    EXPECT_NE(all.find(std::string(3000, '\t') + "Final value = -1\n"), std::string::npos);
+  });
+}
+
+}  // namespace
+}  // namespace thornvale

@@ -1,0 +1,21 @@
+# The boosted-tree engine: tree nodes, model reader and writer, compiled
+# forests and the boosting model.
+add_library(gbdt STATIC
+  BoostingModel/tree.cc
+  BoostingModel/serialize.cc
+  BoostingModel/ModelWriter.cc
+  BoostingModel/BoostingModel.cc)
+target_include_directories(gbdt PUBLIC ${PROJECT_SOURCE_DIR})
+target_link_libraries(gbdt PUBLIC glog::glog)
+
+foreach(test IN ITEMS
+    BoostingModel/tree_test
+    BoostingModel/serialize_test
+    BoostingModel/ModelWriter_test
+    BoostingModel/BoostingModel_test
+    FastTreeEnsemble_test)
+  if(EXISTS ${CMAKE_CURRENT_SOURCE_DIR}/${test}.cc)
+    get_filename_component(name ${test} NAME)
+    reliqa_test(gbdt_${name} SOURCES ${test}.cc LIBS gbdt)
+  endif()
+endforeach()
