@@ -82,6 +82,9 @@ class GlobalRef {
   T get() const noexcept { return ref_; }
   explicit operator bool() const noexcept { return ref_ != nullptr; }
 
+  // Gives up ownership: the reference is then never deleted by this handle.
+  T release() noexcept { return std::exchange(ref_, nullptr); }
+
   void reset() noexcept {
     T old = std::exchange(ref_, nullptr);
     if (old != nullptr) {

@@ -1,0 +1,143 @@
+// libreliqa_jni_testsupport.so: natives of the JVM tests' NativeReference
+// class. They expose what the binding reads (the input record, the server
+// features) as canonical text, and classify through a fresh native classifier
+// without the managed wrappers, so that the tests can compare the binding's
+// answers with the native side's own. Doubles are written as the decimal value
+// of their 64-bit pattern, so every comparison is bit for bit.
+#include <jni.h>
+
+#include <algorithm>
+#include <cstring>
+#include <map>
+#include <string>
+
+#include "host/jni/Environment.h"
+#include "host/jni/Lookup.h"
+#include "host/jni/PersistentKeyValueStoreHybrid.h"
+#include "host/jni/Strings.h"
+#include "reliqaclassifier/ReliqasClassifier.h"
+#include "reliqaclassifier/jni/EntryPoint.h"
+#include "reliqaclassifier/jni/InputReader.h"
+#include "reliqaclassifier/jni/ManagedClasses.h"
+#include "reliqaclassifier/jni/Peers.h"
+#include "reliqaclassifier/jni/UpdateReaders.h"
+
+namespace kestrova::reliqaclassifier {
+namespace {
+
+using mobile::xplat::keystash::PersistentKeyValueStoreHybrid;
+
+std::string bits(double value) {
+  long long pattern;
+  std::memcpy(&pattern, &value, sizeof pattern);
+  return std::to_string(pattern);
+}
+
+std::string flag(bool value) { return value ? "1" : "0"; }
+
+std::string describe(const ReliqaClassifierInput& input) {
+  std::string text;
+  text += "collectionID=" + input.collectionID + "\n";
+  text += "timeSinceStory=" + bits(input.timeSinceStory) + "\n";
+  if (input.locationInfo) {
+    const LocationInfo& l = *input.locationInfo;
+    text += "location=" + l.name + "|" + flag(l.isLandmark) + "|" + bits(l.longitude) + "|" +
+            bits(l.latitude) + "\n";
+  } else {
+    text += "location=absent\n";
+  }
+  const AssetCounts& c = input.assetCounts;
+  text += "counts=" + std::to_string(c.tileCount) + " " + std::to_string(c.totalAssetsCount) +
+          " " + std::to_string(c.photosCount) + " " + std::to_string(c.burstCount) + " " +
+          std::to_string(c.loopsCount) + " " + std::to_string(c.videosCount) + " " +
+          std::to_string(c.totalAssetsWithinBurstsCount) + " " +
+          std::to_string(c.totalAssetsWithinLoopsCount) + " " + std::to_string(c.facesCount) +
+          " " + std::to_string(c.photosWithFacesCount) + "\n";
+  for (const AssetDetail& a : input.assetDetails) {
+    text += "asset=" + a.assetID + "|" + a.assetType + "|" +
+            std::to_string(static_cast<long long>(a.creationDateSinceEpoch)) + "|" +
+            std::to_string(static_cast<long long>(a.modificationDateSinceEpoch)) + "|" +
+            bits(a.pixelWidth) + "|" + bits(a.pixelHeight) + "|" + bits(a.latitude) + "|" +
+            bits(a.longitude) + "|" + bits(a.videoDuration) + "|" + std::to_string(a.isFavorite) +
+            "|" + std::to_string(a.isHidden) + "|" + std::to_string(a.mediaSubtypes) + "|" +
+            std::to_string(a.sourceType) + "|" + flag(a.blurrinessMetric.isCalculated) + "|" +
+            bits(a.blurrinessMetric.value) + "|" + flag(a.darknessMetric.isCalculated) + "|" +
+            bits(a.darknessMetric.value) + "\n";
+  }
+  for (const DuplicateInfo& d : input.duplicateInfos) {
+    text += "dup=" + d.assetIdA + "|" + d.assetIdB + "|" + bits(d.dupeCoefficient) + "\n";
+  }
+  text += "extraCount=" + std::to_string(input.extraCount) + "\n";
+  return text;
+}
+
+jstring toJava(const std::string& text) {
+  return jni::JString::fromStdString(text).release();
+}
+
+// static native String describeInput(ReliqaClassifierInput input)
+jstring describeInput(JNIEnv* env, jclass, jobject input) {
+  return entryPoint<jstring>(env, [&] { return toJava(describe(readReliqaClassifierInput(input))); });
+}
+
+// static native String describeServerFeatures(ReliqaClassifierServerFeatures features)
+jstring describeServerFeatures(JNIEnv* env, jclass, jobject features) {
+  return entryPoint<jstring>(env, [&] {
+    thornvale::FeatureMap map = readServerFeatures(features);
+    std::map<int32_t, double> sorted(map.begin(), map.end());
+    std::string text;
+    for (const auto& [id, value] : sorted) {
+      text += std::to_string(id) + "=" + bits(value) + "\n";
+    }
+    return toJava(text);
+  });
+}
+
+// static native String classifyDirectly(PersistentKeyValueStore store, ReliqaClassifierInput input)
+jstring classifyDirectly(JNIEnv* env, jclass, jobject store, jobject input) {
+  return entryPoint<jstring>(env, [&] {
+    static const PeerClass peerClass = PeerClass::describe(store, managed::kStore);
+    auto* storePeer = PersistentKeyValueStoreHybrid::fromNativePointer(findPeer(store, peerClass));
+    ReliqasClassifier classifier(storePeer->store());
+    ReliqaClassifierResult result = classifier.classify(readReliqaClassifierInput(input));
+    std::string text = "score=" + bits(result.score) + "\n";
+    text += "over=" + flag(result.isOverThreshold) + "\n";
+    std::map<std::string, std::string> sorted(result.loggingData.begin(), result.loggingData.end());
+    for (const auto& [key, value] : sorted) {
+      text += key + "=" + value + "\n";
+    }
+    return toJava(text);
+  });
+}
+
+void registerNatives() {
+  static const JNINativeMethod methods[] = {
+      {const_cast<char*>("describeInput"),
+       const_cast<char*>(
+           "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;)"
+           "Ljava/lang/String;"),
+       reinterpret_cast<void*>(&describeInput)},
+      {const_cast<char*>("describeServerFeatures"),
+       const_cast<char*>(
+           "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierServerFeatures;)"
+           "Ljava/lang/String;"),
+       reinterpret_cast<void*>(&describeServerFeatures)},
+      {const_cast<char*>("classifyDirectly"),
+       const_cast<char*>(
+           "(Lcom/kestrova/keystash/PersistentKeyValueStore;"
+           "Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;)"
+           "Ljava/lang/String;"),
+       reinterpret_cast<void*>(&classifyDirectly)},
+  };
+  JNIEnv* env = jni::Environment::current();
+  jni::LocalRef<jclass> cls =
+      jni::findClassLocal("com/kestrova/sharefold/reliqaclassifier/models/NativeReference");
+  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 3) != JNI_OK);
+}
+
+}  // namespace
+}  // namespace kestrova::reliqaclassifier
+
+extern "C" JNIEXPORT jint JNI_OnLoad(JavaVM* vm, void*) {
+  return kestrova::xplat::initialize(vm, &kestrova::reliqaclassifier::registerNatives);
+}
