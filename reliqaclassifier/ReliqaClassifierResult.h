@@ -6,10 +6,19 @@
 // in practice: any number of threads may read one result at once.
 #pragma once
 
+#include <array>
 #include <string>
 #include <unordered_map>
 
 namespace kestrova::reliqaclassifier {
+
+// The logging data keys, in the order the classifier inserts them.
+inline constexpr char kScoreLoggingKey[] = "score";                  // number text of score
+inline constexpr char kModelIdLoggingKey[] = "model_id";             // stored identifier, or ""
+inline constexpr char kFeatureVectorLoggingKey[] = "feature_vector";  // compact JSON of the features
+inline constexpr char kThresholdLoggingKey[] = "threshold";          // number text of the threshold
+inline constexpr std::array<const char*, 4> kLoggingDataKeys = {
+    kScoreLoggingKey, kModelIdLoggingKey, kFeatureVectorLoggingKey, kThresholdLoggingKey};
 
 struct ReliqaClassifierResult {
   bool isOverThreshold = false;  // score > threshold, strictly

@@ -51,8 +51,10 @@ class ReliqasClassifier {
   std::string currentlyUsedModelId();
 
  private:
-  // (members are the implementation's: mutex, modelParamsCache,
-  // serverFeaturesCache, model)
+  std::mutex mutex;  // guards every use of the caches, the store and `model`
+  thornvale::CacheManager modelParamsCache;     // "model", "model_id", "threshold"
+  thornvale::CacheManager serverFeaturesCache;  // "server_features"
+  std::unique_ptr<thornvale::BoostingModel> model;  // null without a model
 };
 
 }  // namespace kestrova::reliqaclassifier

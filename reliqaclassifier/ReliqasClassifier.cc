@@ -1,0 +1,55 @@
+#include "reliqaclassifier/ReliqasClassifier.h"
+
+#include <utility>
+
+#include "reliqaclassifier/FeatureExtraction.h"
+#include "reliqaclassifier/ModelParamsPersistence.h"
+#include "reliqaclassifier/ResultBuilder.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+
+namespace kestrova::reliqaclassifier {
+
+namespace {
+constexpr char kDefaultKeyPrefix[] = "RELIQA";
+}  // namespace
+
+ReliqasClassifier::ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> store)
+    : ReliqasClassifier(std::move(store), kDefaultKeyPrefix) {}
+
+ReliqasClassifier::ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> store, const std::string& keyPrefix)
+    : modelParamsCache(store, keyPrefix),
+      serverFeaturesCache(store, keyPrefix),
+      model(loadModelFromCache(modelParamsCache)) {}
+
+ReliqasClassifier::~ReliqasClassifier() = default;
+
+ReliqaClassifierResult ReliqasClassifier::classify(const ReliqaClassifierInput& input) {
+  const FeatureMap computed = extractFeatures(input);  // outside the lock: pure and reentrant
+  std::lock_guard<std::mutex> lock(mutex);
+  FeatureMap merged = fetchServerFeatures(serverFeaturesCache);
+  merged.insert(computed.begin(), computed.end());  // a server feature keeps its id
+  return buildResult(merged, model.get(), modelParamsCache);
+}
+
+void ReliqasClassifier::setModelParams(const ReliqaClassifierModelParams& params) {
+  std::lock_guard<std::mutex> lock(mutex);
+  storeModelParams(modelParamsCache, params);
+  if (!params.mSerializedModel.empty()) {
+    // Read back from the store, not from `params`: the model in use is always
+    // the stored one. A text the reader rejects throws here and leaves the
+    // previous model in place.
+    model = loadModelFromCache(modelParamsCache);
+  }
+}
+
+void ReliqasClassifier::setServerFeatures(const FeatureMap& features) {
+  std::lock_guard<std::mutex> lock(mutex);
+  storeServerFeatures(serverFeaturesCache, features);
+}
+
+std::string ReliqasClassifier::currentlyUsedModelId() {
+  std::lock_guard<std::mutex> lock(mutex);
+  return fetchModelId(modelParamsCache);
+}
+
+}  // namespace kestrova::reliqaclassifier
