@@ -1,20 +1,12 @@
 # The `reliqa` command-line tool (build/bin/reliqa) and its tests.
 #
-# reliqa_tool: everything but main(), so that tests and fuzz targets can use
-# the readers. The tool needs the engine (gbdt), the classifier
-# (reliqa_classifier) and the store (keystash); until they exist in the tree it
-# is skipped with a note.
+# reliqa_tool_readers: JSON readers and I/O (records + simdjson only).
+# reliqa_tool_models:  XGBoost conversion, model inspection, partial dependence
+#                      (needs the engine).
+# reliqa:              the tool (needs the classifier and the store as well).
+# Parts whose dependencies are not in the tree yet are skipped with a note.
 set(_reliqa_dir ${CMAKE_CURRENT_SOURCE_DIR}/reliqa)
 
-set(_reliqa_needs gbdt reliqa_classifier keystash)
-set(_reliqa_missing "")
-foreach(t ${_reliqa_needs})
-  if(NOT TARGET ${t})
-    list(APPEND _reliqa_missing ${t})
-  endif()
-endforeach()
-
-# The readers depend only on the records and simdjson.
 add_library(reliqa_tool_readers STATIC
   ${_reliqa_dir}/chart.cc
   ${_reliqa_dir}/collection_reader.cc
@@ -29,7 +21,35 @@ reliqa_test(reliqa_tool_readers_test
   SOURCES ${_reliqa_dir}/collection_reader_test.cc ${_reliqa_dir}/feature_rows_test.cc
   LIBS reliqa_tool_readers)
 
-if(_reliqa_missing)
-  message(STATUS "reliqa tool: waiting for ${_reliqa_missing}; only its readers are built")
+if(NOT TARGET gbdt OR NOT TARGET reliqa_json)
+  message(STATUS "reliqa tool: waiting for the engine (gbdt, reliqa_json); only its readers are built")
   return()
+endif()
+
+add_library(reliqa_tool_models STATIC
+  ${_reliqa_dir}/inspect.cc
+  ${_reliqa_dir}/pdp.cc
+  ${_reliqa_dir}/xgboost_model.cc
+)
+target_link_libraries(reliqa_tool_models PUBLIC reliqa_tool_readers gbdt reliqa_json)
+
+reliqa_test(reliqa_tool_models_test
+  SOURCES ${_reliqa_dir}/xgboost_model_test.cc ${_reliqa_dir}/inspect_pdp_test.cc
+  LIBS reliqa_tool_models)
+
+if(NOT TARGET reliqa_classifier OR NOT TARGET keystash)
+  message(STATUS "reliqa tool: waiting for the classifier (reliqa_classifier, keystash)")
+  return()
+endif()
+
+add_executable(reliqa ${_reliqa_dir}/main.cc ${_reliqa_dir}/commands.cc)
+target_link_libraries(reliqa PRIVATE reliqa_tool_models reliqa_classifier keystash CLI11::CLI11)
+
+# End-to-end tests of the tool as a user runs it: error paths, JSON Lines
+# streaming, the guard that keeps a rejected model out of the store.
+find_program(RELIQA_DEBIAN_PYTHON /usr/bin/python3)
+if(RELIQA_DEBIAN_PYTHON)
+  add_test(NAME reliqa_cli_test
+    COMMAND ${RELIQA_DEBIAN_PYTHON} ${_reliqa_dir}/cli_test.py $<TARGET_FILE:reliqa> ${PROJECT_SOURCE_DIR})
+  set_tests_properties(reliqa_cli_test PROPERTIES ENVIRONMENT "TZ=UTC" TIMEOUT 300)
 endif()

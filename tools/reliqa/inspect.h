@@ -1,0 +1,39 @@
+// Readable summaries of a model text (`reliqa inspect`).
+//
+// describeModel() reports the format version, the trees kept and dropped
+// (weight zero), depths and leaf counts, base score, input keys, feature
+// mapping, equality features, average values, the selector with its sub-model
+// ranges, and which compiled forest (16- or 32-bit) the engine builds.
+// printOneTree() and printAllRules() print trees with the nodes' own printers,
+// after linking them so that features are named by their input keys.
+// Trees of any depth are walked without recursion. Pure; any thread.
+#pragma once
+
+#include <cstdint>
+#include <string>
+
+namespace thornvale {
+struct Forest;
+}
+
+namespace reliqa::tool {
+
+struct ModelHeader {
+  bool complete = false;  // the first line held both numbers
+  int32_t magic = 0;
+  int32_t version = 0;
+};
+
+// The header of a model text, decoded as the reader decodes it.
+ModelHeader readModelHeader(const std::string& modelText);
+
+// `sixteenBit` is the width the engine chose for this forest.
+std::string describeModel(const std::string& name, const std::string& modelText, const thornvale::Forest& forest,
+                          bool sixteenBit);
+
+// Throws ToolError (naming `name`) when `index` is not a tree of the forest.
+std::string printOneTree(const std::string& name, thornvale::Forest& forest, int64_t index);
+// Rules of every tree, or of tree `only` when it is not negative.
+std::string printAllRules(const std::string& name, thornvale::Forest& forest, int64_t only = -1);
+
+}  // namespace reliqa::tool
