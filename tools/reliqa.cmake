@@ -48,7 +48,7 @@ target_link_libraries(reliqa PRIVATE reliqa_tool_models reliqa_classifier keysta
 # End-to-end tests of the tool as a user runs it: error paths, JSON Lines
 # streaming, the guard that keeps a rejected model out of the store.
 find_program(RELIQA_DEBIAN_PYTHON /usr/bin/python3)
-if(RELIQA_DEBIAN_PYTHON)
+if(RELIQA_DEBIAN_PYTHON AND EXISTS ${_reliqa_dir}/cli_test.py)
   add_test(NAME reliqa_cli_test
     COMMAND ${RELIQA_DEBIAN_PYTHON} ${_reliqa_dir}/cli_test.py $<TARGET_FILE:reliqa> ${PROJECT_SOURCE_DIR})
   set_tests_properties(reliqa_cli_test PROPERTIES ENVIRONMENT "TZ=UTC" TIMEOUT 300)

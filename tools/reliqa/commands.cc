@@ -1,0 +1,287 @@
+#include "tools/reliqa/commands.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cmath>
+#include <cstdlib>
+#include <cstring>
+#include <iostream>
+#include <memory>
+
+#include "host/keystash/PersistentKeyValueStore.h"
+#include "reliqaclassifier/FeatureExtraction.h"
+#include "reliqaclassifier/ReliqasClassifier.h"
+#include "tools/reliqa/collection_reader.h"
+#include "tools/reliqa/errors.h"
+#include "tools/reliqa/feature_rows.h"
+#include "tools/reliqa/inspect.h"
+#include "tools/reliqa/pdp.h"
+#include "tools/reliqa/xgboost_model.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
+
+namespace reliqa::tool {
+
+namespace rc = kestrova::reliqaclassifier;
+using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
+
+namespace {
+
+void warn(const std::string& file, const std::string& what) {
+  std::cerr << "reliqa: warning: " << (file.empty() ? "" : file + ": ") << what << std::endl;
+}
+
+// Creates every missing directory above `path`.
+void makeParents(const std::string& path) {
+  for (size_t slash = path.find('/', 1); slash != std::string::npos; slash = path.find('/', slash + 1)) {
+    std::string dir = path.substr(0, slash);
+    if (::mkdir(dir.c_str(), 0755) != 0 && errno != EEXIST) {
+      throw ToolError(path, 0, "cannot create the directory " + dir + ": " + std::strerror(errno));
+    }
+  }
+}
+
+std::shared_ptr<PersistentKeyValueStore> openStore(const std::string& path) {
+  makeParents(path);
+  try {
+    return std::make_shared<PersistentKeyValueStore>(path);
+  } catch (const std::exception& e) {
+    throw ToolError(path, 0, std::string("cannot open the store: ") + e.what());
+  }
+}
+
+std::unique_ptr<rc::ReliqasClassifier> openClassifier(const std::string& storePath) {
+  auto store = openStore(storePath);
+  try {
+    return std::make_unique<rc::ReliqasClassifier>(store);
+  } catch (const std::exception& e) {
+    throw ToolError(storePath, 0,
+                    std::string("the stored model cannot be loaded (") + e.what() +
+                        "); replace it with 'reliqa set-model --model FILE --model-id ID --threshold T'");
+  }
+}
+
+std::unique_ptr<thornvale::BoostingModel> loadModel(const std::string& name, const std::string& text) {
+  try {
+    return std::make_unique<thornvale::BoostingModel>(text);
+  } catch (const std::exception& e) {
+    throw ToolError(name, 0, std::string("the model cannot be loaded: ") + e.what());
+  }
+}
+
+// Calls `onDocument(text, firstLine)` for the input: the whole file for a
+// path, each non-blank line for standard input (JSON Lines).
+template <class F>
+void forEachDocument(const std::string& input, ResultWriter& out, F&& onDocument) {
+  if (input != "-") {
+    onDocument(readFile(input), displayName(input), int64_t{1});
+    return;
+  }
+  LineReader lines(input, &out);
+  std::string line;
+  while (lines.next(line)) {
+    if (line.find_first_not_of(" \t") == std::string::npos) continue;
+    onDocument(line, lines.name(), lines.lineNumber());
+  }
+}
+
+std::string resultJson(const rc::ReliqaClassifierResult& r) {
+  std::string s = "{\"score\":" + thornvale::doubleToJson(r.score) +
+                  ",\"isOverThreshold\":" + (r.isOverThreshold ? "true" : "false") + ",\"loggingData\":{";
+  bool first = true;
+  for (const char* key : {"score", "model_id", "feature_vector", "threshold"}) {
+    auto it = r.loggingData.find(key);
+    if (it == r.loggingData.end()) continue;
+    if (!first) s += ',';
+    first = false;
+    s += jsonString(key) + ":" + jsonString(it->second);
+  }
+  return s + "}}";
+}
+
+}  // namespace
+
+std::string defaultStorePath() {
+  const char* xdg = std::getenv("XDG_DATA_HOME");
+  if (xdg != nullptr && xdg[0] == '/') return std::string(xdg) + "/reliqa/store.db";
+  const char* home = std::getenv("HOME");
+  if (home == nullptr || home[0] == '\0') {
+    throw UsageError("neither XDG_DATA_HOME nor HOME is set; give the store with --store PATH");
+  }
+  return std::string(home) + "/.local/share/reliqa/store.db";
+}
+
+void setModel(const SetModelOptions& o) {
+  if (!std::isfinite(o.threshold)) {
+    throw UsageError("--threshold must be a finite number, got " + thornvale::doubleToText(o.threshold));
+  }
+  rc::ReliqaClassifierModelParams params;
+  params.mModelId = o.modelId;
+  params.mThreshold = o.threshold;
+  if (o.model) {
+    std::string name = displayName(*o.model);
+    params.mSerializedModel = readFile(*o.model);
+    if (!params.mSerializedModel.empty()) {
+      // Load it once here: a model that the classifier cannot load must never
+      // reach the store, where it would stop every later classifier.
+      auto model = loadModel(name, params.mSerializedModel);
+      ModelHeader header = readModelHeader(params.mSerializedModel);
+      if (!header.complete || header.magic != thornvale::kModelMagic) {
+        warn(name, "the magic number is " + std::to_string(header.magic) + ", not " +
+                       std::to_string(thornvale::kModelMagic) + "; stored all the same, as the classifier reads it");
+      }
+      if (header.version < 2 || header.version > 4) {
+        warn(name, "format version " + std::to_string(header.version) +
+                       " is not 2, 3 or 4: the model reads as empty and every score will be 0.5; stored all the same");
+      } else if (model->getForest().trees.empty()) {
+        warn(name, "the model has no trees: every score will be the logistic of its base score; stored all the same");
+      }
+    }
+  }
+  auto classifier = openClassifier(o.store);
+  try {
+    classifier->setModelParams(params);
+  } catch (const std::exception& e) {
+    throw ToolError(o.store, 0, std::string("storing the model parameters failed: ") + e.what());
+  }
+  if (classifier->currentlyUsedModelId() != o.modelId) {
+    throw ToolError(o.store, 0, "the store did not keep the model parameters (see the messages above)");
+  }
+}
+
+void setServerFeatures(const std::string& store, const std::string& file) {
+  thornvale::FeatureMap features = parseServerFeatures(readFile(file), displayName(file));
+  auto classifier = openClassifier(store);
+  try {
+    classifier->setServerFeatures(features);
+  } catch (const std::exception& e) {
+    throw ToolError(store, 0, std::string("storing the server features failed: ") + e.what());
+  }
+}
+
+void printModelId(const std::string& store, ResultWriter& out) {
+  auto classifier = openClassifier(store);
+  out.line(classifier->currentlyUsedModelId());
+}
+
+void classify(const std::string& store, const std::string& input, ResultWriter& out) {
+  auto classifier = openClassifier(store);
+  forEachDocument(input, out, [&](const std::string& text, const std::string& name, int64_t line) {
+    rc::ReliqaClassifierInput collection = parseCollection(text, name, line);
+    std::string json;
+    try {
+      json = resultJson(classifier->classify(collection));
+    } catch (const std::exception& e) {
+      throw ToolError(name, line, std::string("classification failed: ") + e.what());
+    }
+    out.line(json);
+  });
+}
+
+void features(const std::string& input, ResultWriter& out) {
+  forEachDocument(input, out, [&](const std::string& text, const std::string& name, int64_t line) {
+    rc::ReliqaClassifierInput collection = parseCollection(text, name, line);
+    std::string json;
+    try {
+      json = thornvale::featureMapToJson(rc::extractFeatures(collection));
+    } catch (const std::exception& e) {
+      throw ToolError(name, line, std::string("feature extraction failed: ") + e.what());
+    }
+    out.line(json);
+  });
+}
+
+void score(const std::string& modelPath, const std::string& rows, bool raw, ResultWriter& out) {
+  auto model = loadModel(displayName(modelPath), readFile(modelPath));
+  LineReader lines(rows, &out);
+  std::string line;
+  while (lines.next(line)) {
+    if (line.find_first_not_of(" \t") == std::string::npos) continue;
+    thornvale::FeatureMap row = parseFeatureRow(line, lines.name(), lines.lineNumber());
+    out.line(thornvale::doubleToText(raw ? model->rawScore(row) : model->predict(row)));
+  }
+}
+
+void inspect(const InspectOptions& o, ResultWriter& out) {
+  if (o.tree && *o.tree < 0) throw UsageError("--tree: trees are numbered from 0");
+  std::string name = displayName(o.model);
+  std::string text = readFile(o.model);
+  auto model = loadModel(name, text);
+  if (!o.tree && !o.rules) {
+    out.write(describeModel(name, text, model->getForest(), model->uses16BitForest()));
+    return;
+  }
+  thornvale::Forest forest = model->getForest();  // a copy that the printers may link
+  if (o.rules) {
+    out.write(printAllRules(name, forest, o.tree ? *o.tree : -1));
+  } else {
+    out.write(printOneTree(name, forest, *o.tree));
+  }
+}
+
+void pdp(const PdpOptions& o, ResultWriter& out) {
+  if (!std::isfinite(o.from) || !std::isfinite(o.to) || !(o.from < o.to)) {
+    throw UsageError("--from and --to must be finite numbers with --from below --to");
+  }
+  if (o.steps < 2 || o.steps > 1000000) throw UsageError("--steps must be between 2 and 1000000");
+  std::string name = displayName(o.model);
+  auto model = loadModel(name, readFile(o.model));
+  thornvale::FeatureMap fixed;
+  if (o.features) fixed = parseFeatureRow(readFile(*o.features), displayName(*o.features));
+  PdpCurve curve = partialDependence(name, model->getForest(), o.feature, fixed, o.from, o.to, o.steps);
+  if (o.svg) writeFileAtomically(*o.svg, pdpSvg(curve, o.feature, name));
+  out.write(pdpCsv(curve));
+}
+
+void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
+  std::string name = displayName(o.input);
+  XgbModel xgb = readXgboostModel(readFile(o.input), name);
+  std::vector<int32_t> ids = featureIdsOf(xgb, o.featureIds.empty() ? std::vector<int64_t>{} : parseIdList(o.featureIds), name);
+  std::unique_ptr<thornvale::Forest> forest = toForest(xgb, ids);
+  std::string text;
+  try {
+    text = thornvale::writeModel(*forest, 4);
+    loadModel(name, text);  // what we write must load
+  } catch (const std::exception& e) {
+    throw ToolError(name, 0, std::string("the converted model is not usable: ") + e.what());
+  }
+  if (o.output == "-") {
+    out.write(text);
+  } else {
+    writeFileAtomically(o.output, text);
+  }
+  if (verbose) {
+    std::cerr << "reliqa: converted " << xgb.trees.size() << " trees over " << ids.size() << " features into "
+              << o.output << std::endl;
+  }
+}
+
+void writeFileAtomically(const std::string& path, const std::string& bytes) {
+  std::string tmp = path + ".tmp-" + std::to_string(::getpid());
+  int fd = ::open(tmp.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+  if (fd < 0) throw ToolError(path, 0, std::string("cannot write: ") + std::strerror(errno));
+  size_t done = 0;
+  while (done < bytes.size()) {
+    ssize_t n = ::write(fd, bytes.data() + done, bytes.size() - done);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) {
+      int e = errno;
+      ::close(fd);
+      ::unlink(tmp.c_str());
+      throw ToolError(path, 0, std::string("cannot write: ") + std::strerror(e));
+    }
+    done += static_cast<size_t>(n);
+  }
+  if (::fsync(fd) != 0 || ::close(fd) != 0 || ::rename(tmp.c_str(), path.c_str()) != 0) {
+    int e = errno;
+    ::unlink(tmp.c_str());
+    throw ToolError(path, 0, std::string("cannot write: ") + std::strerror(e));
+  }
+}
+
+}  // namespace reliqa::tool
