@@ -1,9 +1,10 @@
 #!/usr/bin/env bash
-# Main job on a fresh Debian 12 machine: set up, build, and score a sample
-# feature vector with the sample model.
+# Main job on a fresh Debian 12 machine: set up, build the reliqa tool, load the
+# example model into the default store and classify the example collection.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 bash scripts/setup.sh
 cmake -S . -B build -G Ninja -Wno-dev >/dev/null
-cmake --build build --target gbdt-demo
-build/bin/gbdt-demo examples/demo/model.txt 3=0.25 17=-1
+cmake --build build --target reliqa
+build/bin/reliqa set-model --model examples/model.txt --model-id example-synthetic-v1 --threshold 0.5
+build/bin/reliqa classify examples/collection.json

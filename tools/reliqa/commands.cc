@@ -240,8 +240,9 @@ void pdp(const PdpOptions& o, ResultWriter& out) {
 
 void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
   std::string name = displayName(o.input);
+  std::vector<int64_t> given = o.featureIds.empty() ? std::vector<int64_t>{} : parseIdList(o.featureIds);
   XgbModel xgb = readXgboostModel(readFile(o.input), name);
-  std::vector<int32_t> ids = featureIdsOf(xgb, o.featureIds.empty() ? std::vector<int64_t>{} : parseIdList(o.featureIds), name);
+  std::vector<int32_t> ids = featureIdsOf(xgb, given, name);
   std::unique_ptr<thornvale::Forest> forest = toForest(xgb, ids);
   std::string text;
   try {

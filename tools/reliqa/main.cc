@@ -169,8 +169,19 @@ int main(int argc, char** argv) {
     return app.exit(e);  // --help
   } catch (const CLI::ParseError& e) {
     std::string cmd = commandPath(app, argc, argv);
-    std::cerr << "reliqa:" << cmd << (cmd.empty() ? " " : ": ") << oneLine(e.what()) << "; see 'reliqa" << cmd
-              << " --help'" << std::endl;
+    std::string what = oneLine(e.what());
+    if (cmd.empty()) {
+      // CLI11 reports an unknown command as a missing one; name it instead.
+      for (int i = 1; i < argc; ++i) {
+        std::string arg = argv[i];
+        if (arg == "--store") ++i;
+        if (arg.empty() || arg[0] == '-') continue;
+        what = "unknown command '" + arg + "'";
+        break;
+      }
+    }
+    std::cerr << "reliqa:" << cmd << (cmd.empty() ? " " : ": ") << what << "; see 'reliqa" << cmd << " --help'"
+              << std::endl;
     return 2;
   }
 

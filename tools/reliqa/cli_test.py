@@ -1,0 +1,275 @@
+#!/usr/bin/python3
+"""End-to-end tests of the reliqa tool, run as a user runs it.
+
+    cli_test.py BUILD/bin/reliqa REPO_ROOT
+
+Covers the error paths (one test per kind of bad input: exit status 2, one
+"reliqa: FILE:LINE: ..." line, nothing on standard output, nothing stored),
+JSON Lines streaming, the guard that keeps a rejected model out of the store,
+and the default store location.
+"""
+
+import base64
+import json
+import os
+import re
+import select
+import shutil
+import struct
+import subprocess
+import sys
+import tempfile
+import unittest
+
+RELIQA = None
+ROOT = None
+MAGIC = 314156
+
+
+def model_text(version=4, tree_record=None):
+    """A model text with one tree (a single leaf of 0.5 unless given)."""
+    def line(b):
+        return base64.b64encode(b).decode() + "\n"
+    if tree_record is None:
+        tree_record = struct.pack("<d", 1.0) + b"C" + struct.pack("<d", 0.5) + struct.pack("<i", 0)
+    text = line(struct.pack("<ii", MAGIC, version)) + line(struct.pack("<dI", 0.0, 1)) + line(tree_record)
+    text += line(struct.pack("<I", 1)) + line(b"k1")
+    if version in (3, 4):
+        text += line(struct.pack("<I", 1)) + line(struct.pack("<i", 1)) + line(struct.pack("<I", 0))
+    if version == 4:
+        text += line(struct.pack("<I", 0))
+    return text
+
+
+def collection(assets=2, **extra):
+    c = {
+        "collectionID": "c1", "timeSinceStory": 3.5, "locationInfo": None, "assetCounts": None,
+        "assetDetails": [{
+            "assetID": f"a{i}", "assetType": "photo", "creationDateSinceEpoch": 1700000000 + 3600 * i,
+            "modificationDateSinceEpoch": -1, "pixelWidth": 4032, "pixelHeight": 3024, "latitude": 38.7,
+            "longitude": -9.1, "videoDuration": 0, "isFavorite": i % 2, "isHidden": 0, "mediaSubtypes": 0,
+            "sourceType": 1, "blurrinessMetric": {"isCalculated": True, "value": 0.1 * i},
+            "darknessMetric": {"isCalculated": False, "value": 0}} for i in range(assets)],
+        "duplicateInfos": [],
+    }
+    c.update(extra)
+    return c
+
+
+class Tool(unittest.TestCase):
+    def setUp(self):
+        self.dir = tempfile.mkdtemp(prefix="reliqa-cli-")
+        self.store = os.path.join(self.dir, "store.db")
+        self.env = dict(os.environ, TZ="UTC", HOME=self.dir, XDG_DATA_HOME=os.path.join(self.dir, "xdg"))
+
+    def tearDown(self):
+        shutil.rmtree(self.dir, ignore_errors=True)
+
+    def path(self, name, content=None):
+        p = os.path.join(self.dir, name)
+        if content is not None:
+            with open(p, "w") as f:
+                f.write(content if isinstance(content, str) else json.dumps(content, indent=1))
+        return p
+
+    def run_tool(self, *args, stdin=None, store=True):
+        argv = [RELIQA] + (["--store", self.store] if store else []) + list(args)
+        return subprocess.run(argv, input=stdin, capture_output=True, text=True, env=self.env, timeout=60)
+
+    def ok(self, *args, **kw):
+        r = self.run_tool(*args, **kw)
+        self.assertEqual(r.returncode, 0, r.stderr)
+        return r.stdout
+
+    def refused(self, *args, pattern, **kw):
+        """Exit 2, nothing on standard output, and a 'reliqa: ...' line matching pattern."""
+        r = self.run_tool(*args, **kw)
+        self.assertEqual(r.returncode, 2, r.stderr)
+        self.assertEqual(r.stdout, "")
+        lines = [l for l in r.stderr.splitlines() if l.startswith("reliqa: ")]
+        self.assertEqual(len(lines), 1, r.stderr)
+        self.assertRegex(lines[0], pattern)
+        return lines[0]
+
+    def classify(self, coll):
+        return json.loads(self.ok("classify", self.path("c.json", coll)))
+
+
+class UsageErrors(Tool):
+    def test_help_exits_zero_on_every_subcommand(self):
+        for cmd in ([], ["set-model"], ["classify"], ["score"], ["pdp"], ["convert", "xgboost"]):
+            r = self.run_tool(*cmd, "--help")
+            self.assertEqual(r.returncode, 0)
+            self.assertIn("Usage:", r.stdout)
+
+    def test_bad_command_lines_exit_2_and_point_to_help(self):
+        cases = [
+            (["bogus"], r"unknown command 'bogus'; see 'reliqa --help'"),
+            (["classify", "--frobnicate", "x"], r"classify: .*--frobnicate.*; see 'reliqa classify --help'"),
+            (["classify"], r"classify: FILE is required"),
+            (["set-model", "--model-id", "x", "--threshold", "abc"], r"set-model: .*--threshold.*abc"),
+            (["set-model", "--model-id", "x", "--threshold", "nan"], r"--threshold must be a finite number"),
+            (["pdp", "m", "--feature", "1", "--from", "2", "--to", "1", "--steps", "5"], r"--from below --to"),
+            (["convert", "xgboost", "m.json", "-o", "x", "--feature-ids", "1;2"], r"--feature-ids"),
+        ]
+        for argv, pattern in cases:
+            with self.subTest(argv=argv):
+                self.refused(*argv, pattern=pattern)
+
+
+class BadInput(Tool):
+    def test_malformed_json_names_file_and_line(self):
+        p = self.path("bad.json", '{\n  "collectionID": "x",\n  "timeSinceStory": 1,,\n}')
+        self.refused("classify", p, pattern=re.escape(p) + r":3: ")
+
+    def test_missing_and_mistyped_fields(self):
+        c = collection()
+        del c["duplicateInfos"]
+        self.refused("classify", self.path("m.json", c), pattern=r"m\.json:1: missing member duplicateInfos")
+        c = collection()
+        c["assetDetails"][1]["pixelWidth"] = "wide"
+        self.refused("features", self.path("t.json", c),
+                     pattern=r"t\.json:\d+: assetDetails\[1\]\.pixelWidth: expected a number, got a string")
+
+    def test_unreadable_files(self):
+        missing = os.path.join(self.dir, "nope.json")
+        self.refused("classify", missing, pattern=re.escape(missing) + r": cannot open: No such file")
+        self.refused("score", "--model", missing, pattern=r"nope\.json: cannot open")
+        self.refused("inspect", self.dir, pattern=r"cannot read: Is a directory")
+
+    def test_bad_feature_rows_and_server_features(self):
+        m = self.path("m.txt", model_text())
+        self.refused("score", "--model", m, stdin='\n{"1":"x"}\n{"1":2}\n',
+                     pattern=r"<stdin>:2: feature 1: expected a number, got a string")
+        self.refused("set-server-features", self.path("sf.json", '{"1": "0.5",\n "2": true}'),
+                     pattern=r"sf\.json:2: feature \"2\": expected a number text")
+
+    def test_unconvertible_xgboost_models(self):
+        j = {"learner": {"objective": {"name": "multi:softprob"}, "gradient_booster": {"name": "gbtree"},
+                         "learner_model_param": {"num_class": "3", "num_feature": "2", "base_score": "5E-1"}}}
+        self.refused("convert", "xgboost", self.path("x.json", j), "-o", self.path("out.txt"),
+                     pattern=r"x\.json: objective \"multi:softprob\" cannot be converted")
+        self.assertFalse(os.path.exists(os.path.join(self.dir, "out.txt")))
+
+    def test_classification_failure_is_reported_not_crashed(self):
+        c = collection(2)
+        for a in c["assetDetails"]:
+            a["latitude"] = 1e308
+        out = self.run_tool("classify", self.path("inf.json", c))
+        # The mean of two huge latitudes overflows to infinity, which JSON cannot hold.
+        self.assertEqual(out.returncode, 2, out.stderr)
+        self.assertRegex(out.stderr, r"reliqa: .*inf\.json:1: classification failed: .*INF")
+
+
+class ModelGuard(Tool):
+    def test_rejected_model_never_reaches_the_store(self):
+        good = self.path("good.txt", model_text())
+        self.ok("set-model", "--model", good, "--model-id", "good", "--threshold", "0.25")
+        before = self.classify(collection())
+        corrupt = model_text(tree_record=struct.pack("<d", 1.0) + b"X")
+        for args, pattern in [
+            (["--model", self.path("bad.txt", corrupt)], r"bad\.txt: the model cannot be loaded: .*tree"),
+            (["--model", "-"], r"<stdin>: the model cannot be loaded"),
+            (["--model", os.path.join(self.dir, "missing.txt")], r"missing\.txt: cannot open"),
+        ]:
+            with self.subTest(args=args):
+                self.refused("set-model", *args, "--model-id", "bad", "--threshold", "0.9", stdin=corrupt,
+                             pattern=pattern)
+                self.assertEqual(self.ok("model-id"), "good\n")
+                self.assertEqual(self.classify(collection()), before)
+
+    def test_accepted_but_unusual_models_warn(self):
+        r = self.run_tool("set-model", "--model", self.path("v7.txt", model_text(version=7)), "--model-id", "v7",
+                          "--threshold", "0.5")
+        self.assertEqual(r.returncode, 0, r.stderr)
+        self.assertRegex(r.stderr, r"warning: .*v7\.txt: format version 7 is not 2, 3 or 4")
+        self.assertEqual(self.ok("model-id"), "v7\n")
+        self.assertEqual(self.classify(collection())["score"], 0.5)
+
+    def test_empty_model_changes_only_id_and_threshold(self):
+        self.ok("set-model", "--model", self.path("good.txt", model_text()), "--model-id", "a", "--threshold", "0.1")
+        score = self.classify(collection())["score"]
+        self.ok("set-model", "--model", self.path("empty.txt", ""), "--model-id", "b", "--threshold", "0.99")
+        r = self.classify(collection())
+        self.assertEqual((r["score"], r["isOverThreshold"]), (score, False))
+        self.assertEqual((r["loggingData"]["model_id"], r["loggingData"]["threshold"]), ("b", "0.99"))
+
+    def test_server_features_replace_and_refusals_keep_them(self):
+        self.ok("set-server-features", self.path("sf.json", {"1": "9.5", "01": "7", "300": 2}))
+        fv = json.loads(self.classify(collection())["loggingData"]["feature_vector"])
+        self.assertEqual((fv["1"], fv["300"]), (9.5, 2))
+        self.refused("set-server-features", self.path("nan.json", {"2": "nan"}), pattern=r"reads as NaN")
+        fv = json.loads(self.classify(collection())["loggingData"]["feature_vector"])
+        self.assertEqual(fv["300"], 2)
+
+
+class Streaming(Tool):
+    def test_each_line_is_answered_before_the_next_arrives(self):
+        p = subprocess.Popen([RELIQA, "--store", self.store, "classify", "-"], stdin=subprocess.PIPE,
+                             stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, text=True, env=self.env)
+        try:
+            for i in range(3):
+                p.stdin.write(json.dumps(collection(i + 1)) + "\n")
+                p.stdin.flush()
+                ready, _, _ = select.select([p.stdout], [], [], 20)
+                self.assertTrue(ready, "no answer while the input stays open")
+                self.assertEqual(json.loads(p.stdout.readline())["score"], 1)
+            p.stdin.close()
+            self.assertEqual(p.stdout.read(), "")
+            self.assertEqual(p.wait(20), 0)
+        finally:
+            p.kill()
+            p.stdout.close()
+
+    def test_answers_in_order_until_a_bad_line(self):
+        lines = [json.dumps(collection(1)), "", json.dumps(collection(3)), '{"collectionID": 5}',
+                 json.dumps(collection(2))]
+        r = self.run_tool("features", "-", stdin="\n".join(lines) + "\n")
+        self.assertEqual(r.returncode, 2)
+        out = [json.loads(l) for l in r.stdout.splitlines()]
+        self.assertEqual([o["4"] for o in out], [0, 0])  # two answers, then the refusal
+        self.assertEqual([o["25"] for o in out], [4032, 4032])
+        self.assertRegex(r.stderr, r"reliqa: <stdin>:4: collectionID: expected a string, got a number")
+
+    def test_score_streams_rows_with_crlf_and_no_final_newline(self):
+        m = self.path("m.txt", model_text())
+        out = self.ok("score", "--model", m, "--raw", stdin='{"1":1}\r\n\n{}')
+        self.assertEqual(out, "0.5\n0.5\n")
+
+
+class Store(Tool):
+    def test_default_store_follows_xdg_and_home(self):
+        self.ok("set-model", "--model-id", "xdg", "--threshold", "0.5", store=False)
+        self.assertTrue(os.path.exists(os.path.join(self.dir, "xdg", "reliqa", "store.db")))
+        del self.env["XDG_DATA_HOME"]
+        self.ok("set-model", "--model-id", "home", "--threshold", "0.5", store=False)
+        self.assertTrue(os.path.exists(os.path.join(self.dir, ".local", "share", "reliqa", "store.db")))
+        self.assertEqual(self.ok("model-id", store=False), "home\n")
+
+    def test_classify_output_shape(self):
+        self.ok("set-model", "--model", self.path("m.txt", model_text()), "--model-id", "m\"1", "--threshold",
+                "0.5")
+        line = self.ok("classify", self.path("c.json", collection()))
+        self.assertTrue(line.startswith('{"score":0.6224593312018546,"isOverThreshold":true,"loggingData":'
+                                        '{"score":"0.6224593312018546","model_id":"m\\"1","feature_vector":"{'))
+        self.assertTrue(line.endswith('","threshold":"0.5"}}\n'))
+
+
+class Inspection(Tool):
+    def test_inspect_and_pdp_on_the_example_model(self):
+        model = os.path.join(ROOT, "examples", "model.txt")
+        summary = self.ok("inspect", model)
+        self.assertRegex(summary, r"format +version 4")
+        self.assertRegex(summary, r"compiled as +16-bit forest \(74 input keys\)")
+        self.assertIn("Final value = ", self.ok("inspect", model, "--tree", "3"))
+        self.refused("inspect", model, "--tree", "100000", pattern=r"there is no tree 100000")
+        svg = self.path("pdp.svg")
+        csv = self.ok("pdp", model, "--feature", "4", "--from", "1", "--to", "60", "--steps", "60", "--svg", svg)
+        self.assertEqual(len(csv.splitlines()), 61)
+        with open(svg) as f:
+            self.assertIn("<polyline", f.read())
+
+
+if __name__ == "__main__":
+    RELIQA, ROOT = sys.argv[1], sys.argv[2]
+    unittest.main(argv=sys.argv[:1], verbosity=1)
