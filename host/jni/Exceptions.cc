@@ -121,11 +121,13 @@ void throwPendingJniExceptionAsCppException() {
 }
 
 void throwCppExceptionIf(bool failed) {
-  if (!failed) {
-    return;
-  }
+  // Always asks the VM, so that checked JNI sees every call that may raise
+  // followed by an exception check; an exception pending after a call that
+  // reported success is raised as well.
   throwPendingJniExceptionAsCppException();
-  throw std::runtime_error("a JNI call failed without raising a Java exception");
+  if (failed) {
+    throw std::runtime_error("a JNI call failed without raising a Java exception");
+  }
 }
 
 void throwNewJavaException(const char* throwableName, const char* message) {

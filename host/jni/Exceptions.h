@@ -45,8 +45,9 @@ class KESTROVA_JNI_API JniException : public std::exception {
   std::string what_;
 };
 
-// When `failed`, raises the pending Java exception as a JniException (a
-// std::runtime_error when nothing is pending).
+// Raises the pending Java exception, if any, as a JniException; otherwise,
+// when `failed`, a std::runtime_error. Call it right after a JNI call that may
+// raise, with that call's failure indication.
 KESTROVA_JNI_API void throwCppExceptionIf(bool failed);
 
 // If a Java exception is pending, clears it and throws it as a JniException.

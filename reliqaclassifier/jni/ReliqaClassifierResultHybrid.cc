@@ -47,7 +47,12 @@ jbyteArray getValueFromLoggingDataWithKey(JNIEnv* env, jobject self, jstring key
     }
     std::string name = jni::JString(key).toStdString();
     const ReliqaClassifierResult& result = resultOf(self);
-    return jni::make_byte_array(result.loggingData.at(name)).release();
+    auto entry = result.loggingData.find(name);
+    if (entry == result.loggingData.end()) {
+      // The message of the standard hash map's at() for a missing key.
+      throw std::out_of_range("_Map_base::at");
+    }
+    return jni::make_byte_array(entry->second).release();
   });
 }
 

@@ -32,8 +32,7 @@ import java.util.concurrent.locks.ReentrantReadWriteLock;
  */
 public final class ReliqaClassifier implements AutoCloseable {
   static {
-    System.loadLibrary("kestrova_host");
-    System.loadLibrary("reliqaclassifier");
+    NativeLibrary.load();
   }
 
   private final ReentrantReadWriteLock mLock = new ReentrantReadWriteLock();
@@ -157,6 +156,10 @@ public final class ReliqaClassifier implements AutoCloseable {
 
   /** The Java face of the native classifier; its natives are registered when the library loads. */
   static final class ReliqaClassifierWrapper {
+    static {
+      NativeLibrary.load();
+    }
+
     HybridData mHybridData;
 
     ReliqaClassifierWrapper(PersistentKeyValueStore store) {

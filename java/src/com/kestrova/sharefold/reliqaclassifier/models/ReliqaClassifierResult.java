@@ -126,6 +126,10 @@ public final class ReliqaClassifierResult implements AutoCloseable {
    * constructor; its natives are registered when the library loads.
    */
   static final class ReliqaClassifierResultWrapper extends HybridClassBase {
+    static {
+      NativeLibrary.load();
+    }
+
     ReliqaClassifierResultWrapper() {}
 
     void destroy() {

@@ -1,0 +1,29 @@
+package com.kestrova.sharefold.reliqaclassifier.models;
+
+import com.kestrova.keystash.PersistentKeyValueStore;
+
+/**
+ * The native side's own view of what the binding reads and computes, as canonical text (see
+ * {@link Fixtures#describe}): doubles are written as the decimal value of their bit pattern.
+ */
+final class NativeReference {
+  static {
+    NativeLibrary.load();
+    System.loadLibrary("reliqa_jni_testsupport");
+  }
+
+  private NativeReference() {}
+
+  /** The native record that the binding's input reader makes of {@code input}. */
+  static native String describeInput(ReliqaClassifierInput input);
+
+  /** The native feature map made of {@code features}: one "id=bits" line per id, ascending. */
+  static native String describeServerFeatures(ReliqaClassifierServerFeatures features);
+
+  /**
+   * Classifies {@code input} with a new native classifier over {@code store}'s native store,
+   * without the managed wrappers: "score=bits", "over=0|1", then "key=value" per logging entry,
+   * keys ascending.
+   */
+  static native String classifyDirectly(PersistentKeyValueStore store, ReliqaClassifierInput input);
+}

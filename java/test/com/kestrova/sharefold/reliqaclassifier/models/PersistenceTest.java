@@ -1,0 +1,58 @@
+package com.kestrova.sharefold.reliqaclassifier.models;
+
+import static com.kestrova.sharefold.reliqaclassifier.models.Fixtures.collection;
+import static com.kestrova.sharefold.reliqaclassifier.models.Fixtures.logistic;
+import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertTrue;
+
+import com.kestrova.keystash.PersistentKeyValueStore;
+import java.io.File;
+import java.nio.charset.StandardCharsets;
+import java.nio.file.Path;
+import java.util.List;
+import java.util.Map;
+import java.util.concurrent.TimeUnit;
+import org.junit.jupiter.api.Test;
+import org.junit.jupiter.api.io.TempDir;
+
+/** Parameters pushed in one JVM process are used by a classifier in the next one. */
+class PersistenceTest {
+  @TempDir Path dir;
+
+  /** Entry point of the writing process: stores parameters and server features, then exits. */
+  public static void main(String[] args) {
+    try (PersistentKeyValueStore store = new PersistentKeyValueStore(args[0]);
+        ReliqaClassifier classifier = new ReliqaClassifier(store)) {
+      classifier.setModelParams(new ReliqaClassifierModelParams(ClassifierTest.MODEL,
+          "from-another-process", 0.6));
+      classifier.setServerFeatures(new ReliqaClassifierServerFeatures(Map.of("4", "9")));
+    }
+  }
+
+  @Test
+  void parametersSurviveTheProcess() throws Exception {
+    String database = dir.resolve("store.db").toString();
+    Process writer = new ProcessBuilder(List.of(
+            System.getProperty("java.home") + File.separator + "bin" + File.separator + "java",
+            "-Xcheck:jni",
+            "-Djava.library.path=" + System.getProperty("java.library.path"),
+            "-cp", System.getProperty("java.class.path"),
+            PersistenceTest.class.getName(), database))
+        .redirectErrorStream(true)
+        .start();
+    assertTrue(writer.waitFor(120, TimeUnit.SECONDS), "writer process hung");
+    String output = new String(writer.getInputStream().readAllBytes(), StandardCharsets.UTF_8);
+    // The writer's output reaches the test log so that JNI warnings there are seen too.
+    System.out.print(output);
+    assertEquals(0, writer.exitValue(), output);
+
+    try (PersistentKeyValueStore store = new PersistentKeyValueStore(database);
+        ReliqaClassifier classifier = new ReliqaClassifier(store);
+        ReliqaClassifierResult result = classifier.classify(collection(3))) {
+      assertEquals("from-another-process", classifier.currentlyUsedModelId());
+      assertEquals("0.6", result.getLoggingValue("threshold"));
+      assertEquals(logistic(3.0), result.getScore(), 1e-6);  // the stored server feature 4 = 9
+      assertTrue(result.isOverThreshold());
+    }
+  }
+}
