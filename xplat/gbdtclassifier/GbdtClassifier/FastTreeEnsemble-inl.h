@@ -1,0 +1,431 @@
+// Compiled forests: a Forest laid out flat for fast scoring.
+//
+// FastTreeEnsemble<float> is the interface; FastTreeEnsembleOOP<FeatureIdT,
+// NodeIndexT> implements it, as the 16-bit forest <short, unsigned int> and
+// the 32-bit forest <int, unsigned int>. init() compiles a Forest once: each
+// tree becomes one array of 12-byte nodes whose two children are adjacent,
+// leaf values carry the tree weight (float(double(value) * weight)), trees of
+// weight zero (+0 or -0) are dropped, and an optional selector tree picks per
+// input which consecutive range of trees (a sub-model) is summed.
+//
+// Scoring: sum = baseScore (double), plus each selected tree's leaf value
+// widened to double, in tree order; score() is 1 / (exp(-sum) + 1). Features
+// and thresholds are compared as floats. A plain tree (and the selector) goes
+// to the second child at the root unless x <= t, and below the root when
+// x > t, so NaN goes second at the root and first deeper down. A tree that
+// tests an equality feature is walked with x != t (second child) at equality
+// splits and x > t at the others, the root included. unnormalizedScore()
+// walks 8 trees at once so that their memory loads overlap, yet adds the
+// leaves in tree order, so it is bit-identical to unnormalizedScoreOneByOne().
+//
+// Errors: init() returns false for a null forest and (after an ERROR log) for
+// a decreasing modelIndexMap; it throws std::range_error when a split's
+// feature id passes the type's limit ("feature id > max size. Use large type
+// for FeatureIdT"), when a child index would not fit ("node index > max
+// size. Use large type for NodeIndexT"), and, when featureMapping is not
+// empty, for a split position outside [0, featureMapping.size()) or an
+// equality feature at or beyond the largest featureMapping entry plus one.
+// With an empty featureMapping every position is accepted (up to the limit;
+// a negative one is kept as position 0) and unnormalizedScoreOfZeros() gives
+// the one score such a model can have. It throws std::runtime_error for a
+// tree with an absent node. Scoring a vector shorter than
+// requiredFeatures() throws std::invalid_argument.
+//
+// Remapping (init with remap = true) translates each split position through
+// featureMapping; the vector is then indexed by feature id, and the equality
+// mask holds bits up to the largest equality feature id.
+//
+// Threads: init() once, then any number of threads may score concurrently.
+#pragma once
+
+#include <glog/logging.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstddef>
+#include <cstdint>
+#include <limits>
+#include <stdexcept>
+#include <string>
+#include <type_traits>
+#include <utility>
+#include <vector>
+
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
+
+namespace thornvale {
+
+// The logistic of a raw score, as every score of the engine computes it.
+inline double logistic(double rawScore) { return 1.0 / (std::exp(-rawScore) + 1.0); }
+
+template <typename FeatureT>
+class FastTreeEnsemble {
+ public:
+  FastTreeEnsemble() = default;
+  FastTreeEnsemble(const FastTreeEnsemble&) = delete;
+  FastTreeEnsemble& operator=(const FastTreeEnsemble&) = delete;
+
+  virtual bool init(const Forest* forest, bool remap) = 0;
+  virtual double unnormalizedScore(const std::vector<FeatureT>& features) const = 0;
+  virtual double score(const std::vector<FeatureT>& features) const = 0;
+  virtual ~FastTreeEnsemble() = default;
+
+  // The same sum as unnormalizedScore(), walking one tree after another.
+  virtual double unnormalizedScoreOneByOne(const std::vector<FeatureT>& features) const = 0;
+  // The raw score when every feature position reads 0.0.
+  virtual double unnormalizedScoreOfZeros() const = 0;
+  // Compiled trees (those of non-zero weight).
+  virtual size_t numTrees() const = 0;
+  // Smallest vector length that scoring accepts: the largest split position + 1.
+  virtual size_t requiredFeatures() const = 0;
+  // 16 or 32: the width of a compiled feature id.
+  virtual int featureIdBits() const = 0;
+};
+
+template <typename FeatureIdT, typename NodeIndexT>
+class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
+  static_assert(std::is_signed<FeatureIdT>::value && std::is_integral<FeatureIdT>::value,
+                "FeatureIdT must be a signed integer");
+  static_assert(std::is_unsigned<NodeIndexT>::value && sizeof(NodeIndexT) <= sizeof(size_t),
+                "NodeIndexT must be an unsigned integer");
+
+ public:
+  struct FlatNode {
+    FeatureIdT featureId;  // split: feature position; kLeaf for a leaf
+    NodeIndexT child;      // split: index of the first child; leaf: 0
+    float value;           // split: threshold; leaf: value * weight
+  };
+  struct FlatTree {
+    std::vector<FlatNode> nodes;  // root at index 0
+    bool hasEqualityFeature = false;
+  };
+
+  static constexpr FeatureIdT kLeaf = -1;
+  static constexpr FeatureIdT kUnfilled = -2;
+  // Largest feature id a split may carry.
+  static constexpr int64_t kMaxFeatureId = std::numeric_limits<FeatureIdT>::max() - 1;
+  // A first-child index at or above this cannot be stored.
+  static constexpr uint64_t kNodeIndexLimit = uint64_t{std::numeric_limits<NodeIndexT>::max()} - 1;
+  static constexpr size_t kBlock = 8;
+
+  bool init(const Forest* forest, bool remap) override;
+
+  double unnormalizedScore(const std::vector<float>& features) const override {
+    checkLength(features);
+    const float* x = features.data();
+    const auto [first, end] = selectModel(x);
+    return sumInterleaved(x, first, end);
+  }
+  double score(const std::vector<float>& features) const override {
+    return logistic(unnormalizedScore(features));
+  }
+  double unnormalizedScoreOneByOne(const std::vector<float>& features) const override {
+    checkLength(features);
+    const float* x = features.data();
+    const auto [first, end] = selectModel(x);
+    return sumOneByOne(x, first, end);
+  }
+  double unnormalizedScoreOfZeros() const override {
+    const Zeros x;
+    const auto [first, end] = selectModel(x);
+    return sumOneByOne(x, first, end);
+  }
+  size_t numTrees() const override { return trees_.size(); }
+  size_t requiredFeatures() const override { return requiredFeatures_; }
+  int featureIdBits() const override { return static_cast<int>(8 * sizeof(FeatureIdT)); }
+
+  // The range [first, end) of trees that the selector chooses for `features`.
+  std::pair<size_t, size_t> selectModel(const std::vector<float>& features) const {
+    checkLength(features);
+    return selectModel(features.data());
+  }
+
+  const std::vector<FlatTree>& getTrees() const { return trees_; }
+  const FlatTree& getSelector() const { return selector_; }
+  double getBaseScore() const { return baseScore_; }
+  const std::vector<uint32_t>& getModelIndexMap() const { return modelIndexMap_; }
+  // Stored bits of the equality mask; positions past its end read as clear.
+  const std::vector<bool>& getEqualityMask() const { return equalityMask_; }
+  const std::vector<uint32_t>& getFeatureMapping() const { return featureMapping_; }
+
+ private:
+  struct Zeros {
+    float operator[](ptrdiff_t) const { return 0.0f; }
+  };
+
+  void checkLength(const std::vector<float>& features) const {
+    if (features.size() < requiredFeatures_) {
+      throw std::invalid_argument("feature vector has " + std::to_string(features.size()) +
+                                  " entries but the compiled forest reads position " +
+                                  std::to_string(requiredFeatures_ - 1));
+    }
+  }
+
+  bool isEquality(ptrdiff_t position) const {
+    return static_cast<size_t>(position) < equalityMask_.size() && equalityMask_[position];
+  }
+
+  void buildEqualityMask(const Forest& forest, bool remap);
+  int32_t checkedPosition(int32_t featureId, const std::string& label) const;
+  void compileTree(const Node& root, double scale, FlatTree& out, const std::string& label);
+
+  // Selector walk result as a model number: truncation toward zero, NaN and
+  // negative values give 0, values beyond the range the largest value.
+  static uint32_t modelNumber(float v) {
+    if (!(v >= 1.0f)) return 0;
+    if (v >= 4294967296.0f) return std::numeric_limits<uint32_t>::max();
+    return static_cast<uint32_t>(v);
+  }
+
+  template <typename X>
+  std::pair<size_t, size_t> selectModel(const X& x) const {
+    const size_t n = trees_.size();
+    if (selector_.nodes.empty()) return {0, n};
+    const FlatNode* nodes = selector_.nodes.data();
+    const uint64_t k = modelIndexMap_.size();
+    // A model number past the last boundary selects the last sub-model.
+    const uint64_t m = std::min<uint64_t>(modelNumber(nodes[plainLeaf(nodes, x)].value), k);
+    const size_t first = m == 0 ? 0 : std::min<size_t>(modelIndexMap_[m - 1], n);
+    const size_t end = m >= k ? n : std::min<size_t>(modelIndexMap_[m], n);
+    return {first, std::max(first, end)};
+  }
+
+  template <typename X>
+  static size_t plainLeaf(const FlatNode* nodes, const X& x) {
+    const FlatNode* n = nodes;
+    if (n->featureId == kLeaf) return 0;
+    size_t i = n->child + static_cast<size_t>(!(x[n->featureId] <= n->value));
+    for (;;) {
+      n = nodes + i;
+      if (n->featureId == kLeaf) return i;
+      __builtin_prefetch(nodes + n->child, 0, 3);
+      i = n->child + static_cast<size_t>(x[n->featureId] > n->value);
+    }
+  }
+
+  template <typename X>
+  size_t equalityLeaf(const FlatNode* nodes, const X& x) const {
+    size_t i = 0;
+    for (;;) {
+      const FlatNode& n = nodes[i];
+      if (n.featureId == kLeaf) return i;
+      __builtin_prefetch(nodes + n.child, 0, 3);
+      const float v = x[n.featureId];
+      const bool second = isEquality(n.featureId) ? v != n.value : v > n.value;
+      i = n.child + static_cast<size_t>(second);
+    }
+  }
+
+  template <typename X>
+  float leafValue(const FlatTree& tree, const X& x) const {
+    const FlatNode* nodes = tree.nodes.data();
+    return nodes[tree.hasEqualityFeature ? equalityLeaf(nodes, x) : plainLeaf(nodes, x)].value;
+  }
+
+  template <typename X>
+  double sumOneByOne(const X& x, size_t first, size_t end) const {
+    double sum = baseScore_;
+    for (size_t i = first; i < end; ++i) sum += static_cast<double>(leafValue(trees_[i], x));
+    return sum;
+  }
+
+  // Walks kBlock trees in lock step; writes their leaf values in tree order.
+  void walkBlock(const FlatTree* block, const float* x, float* leaves) const {
+    const FlatNode* base[kBlock];
+    const FlatNode* cur[kBlock];
+    for (size_t k = 0; k < kBlock; ++k) {
+      const FlatNode* b = block[k].nodes.data();
+      base[k] = b;
+      if (block[k].hasEqualityFeature) {
+        cur[k] = b + equalityLeaf(b, x);
+      } else if (b->featureId == kLeaf) {
+        cur[k] = b;
+      } else {
+        cur[k] = b + b->child + static_cast<size_t>(!(x[b->featureId] <= b->value));
+      }
+    }
+    bool more = true;
+    while (more) {
+      more = false;
+      for (size_t k = 0; k < kBlock; ++k) {
+        const FlatNode* n = cur[k];
+        if (n->featureId != kLeaf) {
+          __builtin_prefetch(base[k] + n->child, 0, 3);
+          cur[k] = base[k] + n->child + static_cast<size_t>(x[n->featureId] > n->value);
+          more = true;
+        }
+      }
+    }
+    for (size_t k = 0; k < kBlock; ++k) leaves[k] = cur[k]->value;
+  }
+
+  double sumInterleaved(const float* x, size_t first, size_t end) const {
+    double sum = baseScore_;
+    size_t i = first;
+    for (; i + kBlock <= end; i += kBlock) {
+      float leaves[kBlock];
+      walkBlock(&trees_[i], x, leaves);
+      for (size_t k = 0; k < kBlock; ++k) sum += static_cast<double>(leaves[k]);
+    }
+    for (; i < end; ++i) sum += static_cast<double>(leafValue(trees_[i], x));
+    return sum;
+  }
+
+  std::vector<FlatTree> trees_;
+  double baseScore_ = 0.0;
+  FlatTree selector_;
+  std::vector<uint32_t> modelIndexMap_;
+  std::vector<bool> equalityMask_;
+  std::vector<uint32_t> featureMapping_;
+  bool remap_ = false;
+  size_t requiredFeatures_ = 0;
+};
+
+template <typename FeatureIdT, typename NodeIndexT>
+bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, bool remap) {
+  if (forest == nullptr) return false;
+  trees_.clear();
+  baseScore_ = forest->baseScore;
+  featureMapping_ = forest->featureMapping;
+  requiredFeatures_ = 0;
+  if (remap && featureMapping_.empty()) {
+    LOG(ERROR) << "Wanted to remap but featureMapping empty";
+  }
+  remap_ = remap && !featureMapping_.empty();
+  buildEqualityMask(*forest, remap);
+
+  trees_.reserve(forest->trees.size());
+  for (size_t i = 0; i < forest->trees.size(); ++i) {
+    const WeightedTree& entry = forest->trees[i];
+    if (entry.weight == 0.0) continue;
+    const std::string label = "tree " + std::to_string(i);
+    if (!entry.tree || !entry.tree->root) throw std::runtime_error(label + " has no nodes");
+    FlatTree flat;
+    compileTree(*entry.tree->root, entry.weight, flat, label);
+    trees_.push_back(std::move(flat));
+  }
+
+  selector_ = FlatTree{};
+  const WeightedTree& selector = forest->modelSelector;
+  if (selector.weight != 0.0 && selector.tree) {
+    if (!selector.tree->root) throw std::runtime_error("model selector tree has no nodes");
+    compileTree(*selector.tree->root, 1.0, selector_, "model selector tree");
+  }
+
+  modelIndexMap_ = forest->modelIndexMap;
+  for (size_t i = 1; i < modelIndexMap_.size(); ++i) {
+    if (modelIndexMap_[i] < modelIndexMap_[i - 1]) {
+      LOG(ERROR) << "modelIndexMap is not monotonically increasing!";
+      return false;
+    }
+  }
+  return true;
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
+void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildEqualityMask(const Forest& forest,
+                                                                    bool remap) {
+  equalityMask_.clear();
+  if (featureMapping_.empty()) return;  // no feature is an equality feature
+  const uint64_t specified =
+      uint64_t{*std::max_element(featureMapping_.begin(), featureMapping_.end())} + 1;
+  // Only positions a split can address are ever looked up.
+  const uint64_t addressable = remap ? uint64_t(kMaxFeatureId) + 1 : featureMapping_.size();
+  std::vector<uint64_t> set;
+  set.reserve(forest.equalityFeatures.size());
+  for (uint32_t e : forest.equalityFeatures) {
+    uint64_t position = e;
+    if (remap) {
+      if (e >= featureMapping_.size()) {
+        throw std::range_error("equality feature entry " + std::to_string(e) +
+                               " is outside the featureMapping of " +
+                               std::to_string(featureMapping_.size()) + " entries");
+      }
+      position = featureMapping_[e];
+    }
+    if (position >= specified) {
+      throw std::range_error("equality feature " + std::to_string(position) +
+                             " is outside the equality mask of " + std::to_string(specified) +
+                             " features");
+    }
+    if (position < addressable) set.push_back(position);
+  }
+  if (set.empty()) return;
+  equalityMask_.assign(*std::max_element(set.begin(), set.end()) + 1, false);
+  for (uint64_t position : set) equalityMask_[position] = true;
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
+int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::checkedPosition(
+    int32_t featureId, const std::string& label) const {
+  if (featureMapping_.empty()) {
+    // Every position reads 0.0 in such a model; a negative one is kept as 0.
+    return featureId < 0 ? 0 : featureId;
+  }
+  if (remap_) {
+    if (featureId < 0) {
+      throw std::range_error("split in " + label + " tests feature id " +
+                             std::to_string(featureId) + " after remapping; ids must be 0 to " +
+                             std::to_string(kMaxFeatureId));
+    }
+    return featureId;
+  }
+  if (featureId < 0 || static_cast<uint64_t>(featureId) >= featureMapping_.size()) {
+    throw std::range_error("split in " + label + " tests feature position " +
+                           std::to_string(featureId) + ", outside the feature vector of " +
+                           std::to_string(featureMapping_.size()) + " positions");
+  }
+  return featureId;
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
+void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, double scale,
+                                                              FlatTree& out,
+                                                              const std::string& label) {
+  out.nodes.clear();
+  out.hasEqualityFeature = false;
+  out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+  std::vector<std::pair<const Node*, size_t>> pending{{&root, 0}};
+  while (!pending.empty()) {
+    const auto [node, slot] = pending.back();
+    pending.pop_back();
+    if (node == nullptr) throw std::runtime_error(label + " has a split without both children");
+    if (node->isLeaf()) {
+      out.nodes[slot].featureId = kLeaf;
+      out.nodes[slot].value =
+          static_cast<float>(static_cast<const ConstantNode*>(node)->value * scale);
+      continue;
+    }
+    const auto& split = *static_cast<const LinearNode*>(node);
+    int32_t id = split.pivotIndex;
+    if (remap_) {
+      if (id < 0 || static_cast<uint64_t>(id) >= featureMapping_.size()) {
+        throw std::range_error("split in " + label + " tests feature position " +
+                               std::to_string(id) + ", outside the featureMapping of " +
+                               std::to_string(featureMapping_.size()) + " entries");
+      }
+      id = static_cast<int32_t>(featureMapping_[id]);
+    }
+    if (int64_t{id} > kMaxFeatureId) {
+      throw std::range_error("feature id > max size. Use large type for FeatureIdT");
+    }
+    const int32_t position = checkedPosition(id, label);
+    const size_t first = out.nodes.size();
+    if (first >= kNodeIndexLimit) {
+      throw std::range_error("node index > max size. Use large type for NodeIndexT");
+    }
+    FlatNode& n = out.nodes[slot];
+    n.featureId = static_cast<FeatureIdT>(position);
+    n.value = static_cast<float>(split.pivotValue);
+    n.child = static_cast<NodeIndexT>(first);
+    if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
+    requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
+    out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+    out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+    pending.emplace_back(split.right.get(), first + 1);
+    pending.emplace_back(split.left.get(), first);
+  }
+}
+
+}  // namespace thornvale

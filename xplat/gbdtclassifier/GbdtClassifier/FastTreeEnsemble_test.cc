@@ -1,0 +1,351 @@
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <limits>
+#include <random>
+#include <set>
+
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+
+namespace thornvale {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using testing::leaf;
+using testing::split;
+using testing::weighted;
+
+using Forest16 = FastTreeEnsembleOOP<short, unsigned int>;
+using Forest32 = FastTreeEnsembleOOP<int, unsigned int>;
+
+const float kNaN = std::numeric_limits<float>::quiet_NaN();
+
+static_assert(sizeof(Forest16::FlatNode) <= 12 && sizeof(Forest32::FlatNode) <= 12);
+
+template <typename E = Forest32>
+std::unique_ptr<E> compiled(const Forest& f) {
+  auto e = std::make_unique<E>();
+  EXPECT_TRUE(e->init(&f, false));
+  return e;
+}
+
+Forest mapped(size_t positions) {
+  Forest f;
+  for (size_t i = 0; i < positions; ++i) f.featureMapping.push_back(static_cast<uint32_t>(100 + i));
+  return f;
+}
+
+// The scoring rules applied straight to the node objects, one tree after
+// another, for comparison with the compiled forests.
+double referenceRaw(const Forest& f, const std::vector<float>& x) {
+  std::set<int32_t> eq;
+  if (!f.featureMapping.empty()) eq.insert(f.equalityFeatures.begin(), f.equalityFeatures.end());
+  auto walk = [&](const Node* n, bool equalityWalk) {
+    for (bool root = true; !n->isLeaf(); root = false) {
+      const auto* s = static_cast<const LinearNode*>(n);
+      const float v = x[s->pivotIndex];
+      const auto t = static_cast<float>(s->pivotValue);
+      bool second;
+      if (equalityWalk) {
+        second = eq.count(s->pivotIndex) ? v != t : v > t;
+      } else {
+        second = root ? !(v <= t) : v > t;
+      }
+      n = second ? s->right.get() : s->left.get();
+    }
+    return static_cast<const ConstantNode*>(n)->value;
+  };
+  auto testsEquality = [&](const Node* root) {
+    std::vector<const Node*> pending{root};
+    while (!pending.empty()) {
+      const Node* n = pending.back();
+      pending.pop_back();
+      if (n->isLeaf()) continue;
+      const auto* s = static_cast<const LinearNode*>(n);
+      if (eq.count(s->pivotIndex)) return true;
+      pending.push_back(s->left.get());
+      pending.push_back(s->right.get());
+    }
+    return false;
+  };
+  std::vector<const WeightedTree*> kept;
+  for (const WeightedTree& t : f.trees) {
+    if (t.weight != 0.0) kept.push_back(&t);
+  }
+  size_t first = 0, end = kept.size();
+  if (f.modelSelector.tree && f.modelSelector.weight != 0.0) {
+    const float v = static_cast<float>(walk(f.modelSelector.tree->root.get(), false));
+    uint64_t m = std::isnan(v) || v < 0 ? 0 : v >= 4294967296.0f ? 4294967295u : uint64_t(v);
+    m = std::min<uint64_t>(m, f.modelIndexMap.size());
+    if (m > 0) first = std::min<size_t>(f.modelIndexMap[m - 1], kept.size());
+    if (m < f.modelIndexMap.size()) end = std::min<size_t>(f.modelIndexMap[m], kept.size());
+  }
+  double sum = f.baseScore;
+  for (size_t i = first; i < end; ++i) {
+    const Node* root = kept[i]->tree->root.get();
+    sum += static_cast<float>(walk(root, testsEquality(root)) * kept[i]->weight);
+  }
+  return sum;
+}
+
+TEST(Compile, LayoutAndLeafValues) {
+  Forest f = mapped(4);
+  // root (f1 <= 0.1): A | B (f3 <= 2): C | D
+  f.trees.push_back(weighted(split(1, 0.1, leaf(1.0), split(3, 2.0, leaf(2.0), leaf(3.0))), 0.1));
+  f.trees.push_back(weighted(leaf(2.0), 0.1));
+  auto e = compiled(f);
+  const auto& nodes = e->getTrees()[0].nodes;
+  ASSERT_EQ(nodes.size(), 5u);
+  EXPECT_EQ(nodes[0].featureId, 1);
+  EXPECT_EQ(nodes[0].child, 1u);
+  EXPECT_EQ(nodes[0].value, 0.1f);
+  EXPECT_EQ(nodes[2].featureId, 3);
+  EXPECT_EQ(nodes[2].child, 3u);
+  for (int i : {1, 3, 4}) {
+    EXPECT_EQ(nodes[i].featureId, -1);
+    EXPECT_EQ(nodes[i].child, 0u);
+  }
+  EXPECT_EQ(nodes[3].value, static_cast<float>(2.0 * 0.1));
+  const auto& single = e->getTrees()[1].nodes;
+  ASSERT_EQ(single.size(), 1u);
+  EXPECT_EQ(single[0].featureId, -1);
+  EXPECT_EQ(single[0].value, 0.2f);
+  EXPECT_EQ(e->requiredFeatures(), 4u);
+}
+
+TEST(Compile, ExactArithmeticOfLeafSumAndLogistic) {
+  Forest f;
+  f.baseScore = 0.5;
+  f.trees.push_back(weighted(leaf(2.0), 0.1));
+  auto e = compiled<Forest16>(f);
+  EXPECT_EQ(static_cast<double>(e->getTrees()[0].nodes[0].value), 0.20000000298023224);
+  EXPECT_EQ(e->unnormalizedScore({}), 0.7000000029802322);
+  EXPECT_EQ(e->score({}), 0.6681877728289219);
+
+  Forest32 empty;
+  EXPECT_EQ(empty.unnormalizedScore({}), 0.0);
+  EXPECT_EQ(empty.score({}), 0.5);
+}
+
+TEST(Compile, ZeroWeightTreesAreDropped) {
+  Forest f;
+  f.trees.push_back(weighted(leaf(1), 0.0));
+  f.trees.push_back(weighted(leaf(1), -0.0));
+  f.trees.push_back(weighted(leaf(1e300), 5e-324));
+  f.trees.push_back(weighted(leaf(1), 1.0));
+  auto e = compiled(f);
+  EXPECT_EQ(e->numTrees(), 2u);
+  EXPECT_EQ(e->getTrees()[0].nodes[0].value, static_cast<float>(1e300 * 5e-324));
+}
+
+TEST(Walks, PlainWalkNaNRuleAndEqualityWalk) {
+  // f0 <= 1 ? (f1 <= 1 ? 1 : 2) : (f1 <= 1 ? 3 : 4)
+  auto make = [] {
+    return split(0, 1.0, split(1, 1.0, leaf(1), leaf(2)), split(1, 1.0, leaf(3), leaf(4)));
+  };
+  Forest f = mapped(3);
+  f.trees.push_back(weighted(make(), 1));
+  auto plain = compiled(f);
+  EXPECT_FALSE(plain->getTrees()[0].hasEqualityFeature);
+  EXPECT_EQ(plain->unnormalizedScore({1.0f, 1.0f, 0}), 1);     // equal goes first
+  EXPECT_EQ(plain->unnormalizedScore({kNaN, 0.0f, 0}), 3);     // NaN at the root: second
+  EXPECT_EQ(plain->unnormalizedScore({0.0f, kNaN, 0}), 1);     // NaN deeper: first
+  EXPECT_EQ(plain->unnormalizedScore({kNaN, kNaN, 0}), 3);
+
+  // Feature 1 is an equality feature: x == t first, anything else (NaN too)
+  // second; the ordinary root split now sends NaN first.
+  f.equalityFeatures = {1};
+  auto eq = compiled(f);
+  EXPECT_TRUE(eq->getTrees()[0].hasEqualityFeature);
+  EXPECT_EQ(eq->unnormalizedScore({0.0f, 1.0f, 0}), 1);
+  EXPECT_EQ(eq->unnormalizedScore({0.0f, 0.5f, 0}), 2);
+  EXPECT_EQ(eq->unnormalizedScore({0.0f, 1.5f, 0}), 2);
+  EXPECT_EQ(eq->unnormalizedScore({kNaN, kNaN, 0}), 2);
+  EXPECT_EQ(eq->unnormalizedScore({1.0f, 1.0f, 0}), 1);
+
+  // Without featureMapping no feature is an equality feature.
+  Forest unmapped;
+  unmapped.trees.push_back(weighted(make(), 1));
+  unmapped.equalityFeatures = {1};
+  auto none = compiled(unmapped);
+  EXPECT_FALSE(none->getTrees()[0].hasEqualityFeature);
+  EXPECT_TRUE(none->getEqualityMask().empty());
+}
+
+TEST(SubModels, SelectorChoosesTreeRanges) {
+  Forest f = mapped(1);
+  for (int i = 0; i < 3; ++i) f.trees.push_back(weighted(leaf(1 << i), 1));
+  f.baseScore = 0.25;
+  // Selector: f0 <= 0 ? 0 : f0 <= 1 ? 1.9 : f0 <= 2 ? 2.7 : f0 <= 3 ? -1.5 : 7
+  f.modelSelector = weighted(
+      split(0, 0, leaf(0),
+            split(0, 1, leaf(1.9), split(0, 2, leaf(2.7), split(0, 3, leaf(-1.5), leaf(7))))),
+      0.5);  // the weight only switches the selector on
+  f.modelIndexMap = {2, 2};
+  auto e = compiled(f);
+  EXPECT_EQ(e->unnormalizedScore({0}), 0.25 + 1 + 2);  // model 0: trees 0, 1
+  EXPECT_EQ(e->unnormalizedScore({1}), 0.25);          // model 1: empty
+  EXPECT_EQ(e->unnormalizedScore({2}), 0.25 + 4);      // 2.7 -> model 2
+  EXPECT_EQ(e->unnormalizedScore({3}), 0.25 + 1 + 2);  // -1.5 -> model 0
+  EXPECT_EQ(e->unnormalizedScore({4}), 0.25 + 4);      // beyond the map: last model
+
+  f.modelIndexMap = {1, 9};  // a boundary past the trees is clamped
+  EXPECT_EQ(compiled(f)->unnormalizedScore({1}), 0.25 + 2 + 4);
+
+  f.modelIndexMap.clear();  // only model 0, all trees
+  EXPECT_EQ(compiled(f)->unnormalizedScore({2}), 0.25 + 7);
+
+  f.modelSelector.tree->root = leaf(std::numeric_limits<double>::quiet_NaN());
+  f.modelIndexMap = {1};
+  EXPECT_EQ(compiled(f)->unnormalizedScore({0}), 0.25 + 1);
+  f.modelSelector.tree->root = leaf(1e12);
+  EXPECT_EQ(compiled(f)->unnormalizedScore({0}), 0.25 + 2 + 4);
+
+  f.modelSelector.weight = 0.0;  // switched off: all trees
+  EXPECT_TRUE(compiled(f)->getSelector().nodes.empty());
+}
+
+TEST(InitResults, NullDecreasingMapAndRemapWithoutMapping) {
+  testing::LogCapture log;
+  Forest32 e;
+  EXPECT_FALSE(e.init(nullptr, false));
+
+  Forest f;
+  f.trees.push_back(weighted(leaf(1), 1));
+  f.modelIndexMap = {3, 1};
+  EXPECT_FALSE(e.init(&f, false));
+  EXPECT_EQ(e.numTrees(), 1u);
+  EXPECT_THAT(e.getModelIndexMap(), ElementsAre(3, 1));
+  f.modelIndexMap = {1, 1};
+  EXPECT_TRUE(e.init(&f, true));
+  EXPECT_THAT(log.at(google::GLOG_ERROR),
+              ElementsAre("modelIndexMap is not monotonically increasing!",
+                          "Wanted to remap but featureMapping empty"));
+}
+
+TEST(InitResults, RemapTranslatesPositions) {
+  Forest f = mapped(0);
+  f.featureMapping = {5, 2};
+  f.equalityFeatures = {0};  // remapped to feature id 5
+  f.trees.push_back(weighted(split(0, 1.0, leaf(1), leaf(2)), 1));
+  Forest32 e;
+  EXPECT_TRUE(e.init(&f, true));
+  EXPECT_EQ(e.getTrees()[0].nodes[0].featureId, 5);
+  EXPECT_TRUE(e.getTrees()[0].hasEqualityFeature);
+  EXPECT_EQ(e.unnormalizedScore({0, 0, 0, 0, 0, 1.0f}), 1);
+  EXPECT_EQ(e.unnormalizedScore({0, 0, 0, 0, 0, 0.5f}), 2);
+}
+
+TEST(Limits, FeatureIdLimitsThenPositionChecks) {
+  auto withSplitOn = [](int32_t position, size_t mappingSize) {
+    Forest f = mapped(mappingSize);
+    f.trees.push_back(weighted(split(position, 0, leaf(0), leaf(1)), 1));
+    return f;
+  };
+  auto throwsRange = [](auto&& init, const char* text) {
+    EXPECT_THAT(init, ::testing::ThrowsMessage<std::range_error>(HasSubstr(text))) << text;
+  };
+  const char* kFeatureId = "feature id > max size. Use large type for FeatureIdT";
+
+  auto init = [](auto& e, Forest f) { return e.init(&f, false); };
+
+  Forest16 e16;
+  EXPECT_TRUE(init(e16, withSplitOn(32766, 32767)));
+  EXPECT_EQ(e16.getTrees()[0].nodes[0].featureId, 32766);
+  throwsRange([&] { init(e16, withSplitOn(32767, 40000)); }, kFeatureId);
+  throwsRange([&] { init(e16, withSplitOn(70000, 10)); }, kFeatureId);  // checked before narrowing
+  Forest32 e32;
+  EXPECT_TRUE(init(e32, withSplitOn(2147483646, 0)));
+  throwsRange([&] { init(e32, withSplitOn(2147483647, 0)); }, kFeatureId);
+
+  // With a featureMapping, positions must lie inside its vector.
+  throwsRange([&] { init(e32, withSplitOn(10, 10)); },
+              "tests feature position 10, outside the feature vector of 10 positions");
+  throwsRange([&] { init(e16, withSplitOn(-3, 10)); }, "feature position -3");
+  Forest selector = withSplitOn(0, 2);
+  selector.modelSelector = weighted(split(2, 0, leaf(0), leaf(1)), 1);
+  throwsRange([&] { init(e32, std::move(selector)); }, "model selector tree");
+}
+
+TEST(Limits, EqualityMaskIsBoundedByTheVector) {
+  Forest f = mapped(0);
+  f.featureMapping = {7, 0xFFFFFFFFu, 3};
+  f.trees.push_back(weighted(split(2, 0, leaf(0), leaf(1)), 1));
+  f.equalityFeatures = {2, 5, 4000000000u};  // 5 and 4e9 lie past the vector: no effect
+  Forest32 e;
+  EXPECT_TRUE(e.init(&f, false));
+  EXPECT_EQ(e.getEqualityMask().size(), 3u);
+  EXPECT_TRUE(e.getTrees()[0].hasEqualityFeature);
+
+  f.featureMapping = {7, 1, 3};
+  f.equalityFeatures = {8};  // at the specified size (largest entry + 1)
+  EXPECT_THAT([&] { e.init(&f, false); },
+              ::testing::ThrowsMessage<std::range_error>(
+                  HasSubstr("equality feature 8 is outside the equality mask of 8 features")));
+}
+
+TEST(Scoring, ShortVectorsAreRefused) {
+  Forest f = mapped(3);
+  f.trees.push_back(weighted(split(2, 0, leaf(0), leaf(1)), 1));
+  auto e = compiled(f);
+  EXPECT_THROW(e->unnormalizedScore({0, 0}), std::invalid_argument);
+  EXPECT_EQ(e->unnormalizedScore({0, 0, 1}), 1);
+}
+
+// The interleaved walk must give exactly the one-by-one sum and the rules
+// applied to the node objects, for any mix of plain and equality trees,
+// tree counts that are not multiples of the block, NaN and equal features.
+template <typename E>
+void checkAgainstReference(uint64_t seed) {
+  std::mt19937_64 rng(seed);
+  for (int round = 0; round < 12; ++round) {
+    const size_t count = 1 + rng() % 40;
+    Forest f = testing::randomForest(rng(), count, 1 + static_cast<int>(rng() % 6), 10);
+    f.trees[rng() % count].weight = 0.0;
+    if (round % 3 != 0) f.equalityFeatures = {static_cast<uint32_t>(rng() % 10)};
+    if (round % 2 == 1) {
+      f.modelSelector = weighted(testing::randomFullTree(rng, 2, 10), 1);
+      std::vector<Node*> pending{f.modelSelector.tree->root.get()};
+      while (!pending.empty()) {  // selector leaves name models 0..3
+        Node* n = pending.back();
+        pending.pop_back();
+        if (n->isLeaf()) {
+          static_cast<ConstantNode*>(n)->value = static_cast<double>(rng() % 40) / 10.0;
+        } else {
+          pending.push_back(static_cast<LinearNode*>(n)->left.get());
+          pending.push_back(static_cast<LinearNode*>(n)->right.get());
+        }
+      }
+      f.modelIndexMap = {static_cast<uint32_t>(count / 3), static_cast<uint32_t>(count / 2)};
+    }
+    auto e = compiled<E>(f);
+    std::uniform_real_distribution<float> u(-1.2f, 1.2f);
+    for (int v = 0; v < 50; ++v) {
+      std::vector<float> x(10);
+      for (float& xi : x) {
+        const auto r = rng() % 10;
+        xi = r == 0 ? kNaN : r == 1 ? 0.0f : u(rng);
+      }
+      if (v % 5 == 0) {  // hit some thresholds exactly
+        const auto* root = static_cast<const LinearNode*>(f.trees[0].tree->root.get());
+        if (!root->isLeaf()) x[root->pivotIndex] = static_cast<float>(root->pivotValue);
+      }
+      const double expected = referenceRaw(f, x);
+      ASSERT_TRUE(testing::sameBits(e->unnormalizedScore(x), expected)) << round << "/" << v;
+      ASSERT_TRUE(testing::sameBits(e->unnormalizedScoreOneByOne(x), expected)) << round;
+      ASSERT_TRUE(testing::sameBits(e->score(x), logistic(expected)));
+    }
+    const std::vector<float> zeros(10, 0.0f);
+    EXPECT_TRUE(testing::sameBits(e->unnormalizedScoreOfZeros(), referenceRaw(f, zeros)));
+  }
+}
+
+TEST(Scoring, InterleavedEqualsReference16) { checkAgainstReference<Forest16>(1); }
+TEST(Scoring, InterleavedEqualsReference32) { checkAgainstReference<Forest32>(2); }
+
+}  // namespace
+}  // namespace thornvale
