@@ -110,6 +110,31 @@ jstring classifyDirectly(JNIEnv* env, jclass, jobject store, jobject input) {
   });
 }
 
+// A registration that fails: the class has no such native.
+void registerMissingNative() {
+  static const JNINativeMethod methods[] = {
+      {const_cast<char*>("noSuchNative"), const_cast<char*>("()V"),
+       reinterpret_cast<void*>(&registerMissingNative)},
+  };
+  JNIEnv* env = jni::Environment::current();
+  jni::LocalRef<jclass> cls =
+      jni::findClassLocal("com/kestrova/sharefold/reliqaclassifier/models/NativeReference");
+  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 1) != JNI_OK);
+}
+
+// static native void initializeWithFailingRegistration()
+// Runs the layer's initialiser as JNI_OnLoad would, with a registration that
+// fails. The initialiser must answer JNI_ERR and leave the VM's error pending,
+// which this method then throws.
+void initializeWithFailingRegistration(JNIEnv* env, jclass) {
+  JavaVM* vm = nullptr;
+  env->GetJavaVM(&vm);
+  if (kestrova::xplat::initialize(vm, &registerMissingNative) != JNI_ERR) {
+    env->ExceptionClear();
+    env->ThrowNew(env->FindClass("java/lang/AssertionError"), "initialize did not fail");
+  }
+}
+
 void registerNatives() {
   static const JNINativeMethod methods[] = {
       {const_cast<char*>("describeInput"),
@@ -128,11 +153,13 @@ void registerNatives() {
            "Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;)"
            "Ljava/lang/String;"),
        reinterpret_cast<void*>(&classifyDirectly)},
+      {const_cast<char*>("initializeWithFailingRegistration"), const_cast<char*>("()V"),
+       reinterpret_cast<void*>(&initializeWithFailingRegistration)},
   };
   JNIEnv* env = jni::Environment::current();
   jni::LocalRef<jclass> cls =
       jni::findClassLocal("com/kestrova/sharefold/reliqaclassifier/models/NativeReference");
-  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 3) != JNI_OK);
+  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 4) != JNI_OK);
 }
 
 }  // namespace

@@ -26,4 +26,10 @@ final class NativeReference {
    * keys ascending.
    */
   static native String classifyDirectly(PersistentKeyValueStore store, ReliqaClassifierInput input);
+
+  /**
+   * Runs the host layer's initializer with a registration callback that fails; the initializer's
+   * failure (the VM's NoSuchMethodError) is thrown from here.
+   */
+  static native void initializeWithFailingRegistration();
 }

@@ -84,6 +84,44 @@ class PeerTest {
     }
   }
 
+  private static long nativePointer(Object destructor) throws Exception {
+    java.lang.reflect.Field field = destructor.getClass().getDeclaredField("mNativePointer");
+    field.setAccessible(true);
+    return field.getLong(destructor);
+  }
+
+  @Test
+  void peersOfUnreachableObjectsAreDestroyedByTheCleaner() throws Exception {
+    Object classifierDestructor;
+    Object resultDestructor;
+    try (PersistentKeyValueStore store = new PersistentKeyValueStore(dir.resolve("s").toString())) {
+      ReliqaClassifier classifier = new ReliqaClassifier(store);
+      ReliqaClassifierResult result = classifier.classify(collection(3));
+      classifierDestructor = Fixtures.field(wrapperOf(classifier).mHybridData, "mDestructor");
+      java.lang.reflect.Field field =
+          com.kestrova.jni.HybridClassBase.class.getDeclaredField("mDestructor");
+      field.setAccessible(true);
+      resultDestructor = field.get(wrapperOf(result));
+      assertEquals(true, nativePointer(classifierDestructor) != 0);
+      assertEquals(true, nativePointer(resultDestructor) != 0);
+      classifier = null;
+      result = null;
+    }
+    long deadline = System.nanoTime() + 30_000_000_000L;
+    while ((nativePointer(classifierDestructor) != 0 || nativePointer(resultDestructor) != 0)
+        && System.nanoTime() < deadline) {
+      System.gc();
+      Thread.sleep(10);
+    }
+    assertEquals(0, nativePointer(classifierDestructor));
+    assertEquals(0, nativePointer(resultDestructor));
+  }
+
+  @Test
+  void aFailingRegistrationFailsTheLoadWithTheVmsError() {
+    assertThrows(NoSuchMethodError.class, NativeReference::initializeWithFailingRegistration);
+  }
+
   private static void assertNoPeer(Executable call) {
     NullPointerException e = assertThrows(NullPointerException.class, call);
     assertEquals("java.lang.NullPointerException", e.getMessage());
