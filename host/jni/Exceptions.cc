@@ -1,6 +1,7 @@
 #include "host/jni/Exceptions.h"
 
 #include <cstdarg>
+#include <cstdlib>
 #include <new>
 #include <stdexcept>
 #include <vector>

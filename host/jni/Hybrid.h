@@ -18,6 +18,7 @@
 
 #include <jni.h>
 
+#include <cstdint>
 #include <memory>
 
 #include "host/jni/Api.h"
