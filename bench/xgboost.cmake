@@ -1,0 +1,29 @@
+# Side-by-side benchmark against XGBoost's C API (libxgboost-dev).
+#
+#   cmake --build build --target xgboost_bench_models   # trains and converts the models once
+#   build/bin/xgboost_bench
+#
+# Debian's xgboost package config refers to a command-line binary that the
+# package does not ship, so find_package(xgboost) fails there; the library and
+# its header are found directly instead.
+find_library(RELIQA_XGBOOST_LIBRARY NAMES xgboost)
+find_path(RELIQA_XGBOOST_INCLUDE xgboost/c_api.h)
+find_program(RELIQA_BENCH_PYTHON /usr/bin/python3)
+if(NOT RELIQA_XGBOOST_LIBRARY OR NOT RELIQA_XGBOOST_INCLUDE OR NOT TARGET gbdt OR NOT TARGET reliqa)
+  message(STATUS "xgboost_bench: skipped (needs libxgboost-dev and the reliqa tool)")
+  return()
+endif()
+
+set(_xgb_models ${CMAKE_BINARY_DIR}/xgboost-bench-models)
+add_custom_command(
+  OUTPUT ${_xgb_models}/m2000_d8.txt
+  COMMAND ${RELIQA_BENCH_PYTHON} ${CMAKE_CURRENT_LIST_DIR}/xgboost_models.py $<TARGET_FILE:reliqa> ${_xgb_models}
+  DEPENDS reliqa ${CMAKE_CURRENT_LIST_DIR}/xgboost_models.py
+  COMMENT "Training and converting the XGBoost benchmark models (a few minutes)"
+  VERBATIM)
+add_custom_target(xgboost_bench_models DEPENDS ${_xgb_models}/m2000_d8.txt)
+
+add_executable(xgboost_bench ${CMAKE_CURRENT_LIST_DIR}/xgboost_bench.cc)
+target_include_directories(xgboost_bench PRIVATE ${RELIQA_XGBOOST_INCLUDE})
+target_link_libraries(xgboost_bench PRIVATE gbdt benchmark::benchmark ${RELIQA_XGBOOST_LIBRARY})
+target_compile_definitions(xgboost_bench PRIVATE RELIQA_XGBOOST_BENCH_MODELS="${_xgb_models}")

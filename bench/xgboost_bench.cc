@@ -1,0 +1,207 @@
+// Side by side: XGBoost's own predictor (C API, one row per call) and our
+// compiled forest, on the same models and the same float rows.
+//
+// The models are XGBoost models of 100 trees of depth 6, 500 of depth 6 and
+// 2000 of depth 8 over 74 features, and their conversions by
+// `reliqa convert xgboost`; build the target xgboost_bench_models to make
+// them (or pass their directory as the first argument). Before timing, every
+// row is scored by both, and the verdicts at 0.5 and the largest score
+// difference are reported. After the run a table gives both times per row and
+// their ratio.
+#include <benchmark/benchmark.h>
+#include <glog/logging.h>
+#include <xgboost/c_api.h>
+
+#include <cinttypes>
+#include <cmath>
+#include <cstdio>
+#include <fstream>
+#include <map>
+#include <memory>
+#include <random>
+#include <sstream>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+
+namespace {
+
+constexpr int kFeatures = 74;
+constexpr int kRows = 1024;
+const char* const kModels[] = {"m100_d6", "m500_d6", "m2000_d8"};
+
+void check(int rc, const char* what) {
+  if (rc != 0) throw std::runtime_error(std::string(what) + ": " + XGBGetLastError());
+}
+
+std::string readAll(const std::string& path) {
+  std::ifstream in(path, std::ios::binary);
+  if (!in) throw std::runtime_error("cannot read " + path + " (build the target xgboost_bench_models first)");
+  std::ostringstream s;
+  s << in.rdbuf();
+  return s.str();
+}
+
+// The same rows for both sides: floats drawn like the training data.
+std::vector<std::vector<float>> makeRows() {
+  std::mt19937_64 rng(20261123);
+  std::normal_distribution<float> normal;
+  std::vector<std::vector<float>> rows(kRows, std::vector<float>(kFeatures));
+  for (auto& row : rows) {
+    for (float& v : row) v = normal(rng);
+  }
+  return rows;
+}
+
+class XgboostModel {
+ public:
+  explicit XgboostModel(const std::string& path) {
+    check(XGBoosterCreate(nullptr, 0, &booster_), "XGBoosterCreate");
+    check(XGBoosterLoadModel(booster_, path.c_str()), "XGBoosterLoadModel");
+    check(XGBoosterSetParam(booster_, "nthread", "1"), "XGBoosterSetParam");
+    check(XGProxyDMatrixCreate(&proxy_), "XGProxyDMatrixCreate");
+  }
+  ~XgboostModel() {
+    XGDMatrixFree(proxy_);
+    XGBoosterFree(booster_);
+  }
+  XgboostModel(const XgboostModel&) = delete;
+  XgboostModel& operator=(const XgboostModel&) = delete;
+
+  // The array-interface text of one row; made once per row, outside timing.
+  static std::string arrayInterface(const std::vector<float>& row) {
+    char buf[160];
+    std::snprintf(buf, sizeof buf,
+                  "{\"data\": [%" PRIuPTR ", true], \"shape\": [1, %d], \"typestr\": \"<f4\", \"version\": 3}",
+                  reinterpret_cast<uintptr_t>(row.data()), kFeatures);
+    return buf;
+  }
+
+  float predict(const std::string& rowInterface) const {
+    static const char* config =
+        "{\"type\": 0, \"training\": false, \"iteration_begin\": 0, \"iteration_end\": 0, "
+        "\"strict_shape\": false, \"missing\": NaN, \"cache_id\": 0}";
+    const bst_ulong* shape = nullptr;
+    bst_ulong dim = 0;
+    const float* result = nullptr;
+    check(XGBoosterPredictFromDense(booster_, rowInterface.c_str(), config, proxy_, &shape, &dim, &result),
+          "XGBoosterPredictFromDense");
+    return result[0];
+  }
+
+ private:
+  BoosterHandle booster_ = nullptr;
+  DMatrixHandle proxy_ = nullptr;
+};
+
+struct Pair {
+  std::unique_ptr<XgboostModel> xgboost;
+  std::unique_ptr<thornvale::BoostingModel> ours;
+};
+
+std::string gModelDir = RELIQA_XGBOOST_BENCH_MODELS;
+std::vector<std::vector<float>> gRows;
+std::vector<std::string> gInterfaces;
+std::map<std::string, Pair> gPairs;
+
+Pair& pairFor(const std::string& name) {
+  auto it = gPairs.find(name);
+  if (it != gPairs.end()) return it->second;
+  Pair p;
+  p.xgboost = std::make_unique<XgboostModel>(gModelDir + "/" + name + ".json");
+  p.ours = std::make_unique<thornvale::BoostingModel>(readAll(gModelDir + "/" + name + ".txt"));
+  return gPairs.emplace(name, std::move(p)).first->second;
+}
+
+void BM_Xgboost(benchmark::State& state, const char* name) {
+  Pair& p = pairFor(name);
+  size_t i = 0;
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(p.xgboost->predict(gInterfaces[i]));
+    i = (i + 1) % gInterfaces.size();
+  }
+}
+
+void BM_Reliqa(benchmark::State& state, const char* name) {
+  const thornvale::FastTreeEnsemble<float>& forest = pairFor(name).ours->getEnsemble();
+  size_t i = 0;
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(forest.score(gRows[i]));
+    i = (i + 1) % gRows.size();
+  }
+}
+
+// Verdicts at 0.5 and the largest score difference over all rows.
+void compareScores() {
+  std::printf("%-10s %8s %20s %18s\n", "model", "rows", "verdict mismatches", "max |score diff|");
+  for (const char* name : kModels) {
+    Pair& p = pairFor(name);
+    int mismatches = 0;
+    double worst = 0.0;
+    for (size_t i = 0; i < gRows.size(); ++i) {
+      double theirs = p.xgboost->predict(gInterfaces[i]);
+      double ours = p.ours->getEnsemble().score(gRows[i]);
+      mismatches += (theirs > 0.5) != (ours > 0.5);
+      worst = std::max(worst, std::fabs(theirs - ours));
+    }
+    std::printf("%-10s %8zu %20d %18.3g\n", name, gRows.size(), mismatches, worst);
+  }
+  std::printf("\n");
+}
+
+// Prints the usual console output, then both times per row and their ratio.
+class RatioReporter : public benchmark::ConsoleReporter {
+ public:
+  void ReportRuns(const std::vector<Run>& runs) override {
+    ConsoleReporter::ReportRuns(runs);
+    for (const Run& r : runs) {
+      if (r.run_type == Run::RT_Iteration && r.error_message.empty()) {
+        times_[r.benchmark_name()] = r.GetAdjustedCPUTime();
+      }
+    }
+  }
+  void Finalize() override {
+    ConsoleReporter::Finalize();
+    std::printf("\n%-10s %16s %16s %10s\n", "model", "XGBoost us/row", "reliqa us/row", "ratio");
+    for (const char* name : kModels) {
+      auto x = times_.find(std::string("BM_Xgboost/") + name);
+      auto r = times_.find(std::string("BM_Reliqa/") + name);
+      if (x == times_.end() || r == times_.end()) continue;
+      std::printf("%-10s %16.3f %16.3f %9.1fx\n", name, x->second, r->second, x->second / r->second);
+    }
+  }
+
+ private:
+  std::map<std::string, double> times_;
+};
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  google::InitGoogleLogging(argv[0]);
+  FLAGS_minloglevel = google::GLOG_WARNING;  // the engine logs each model load at INFO
+  benchmark::Initialize(&argc, argv);
+  if (argc > 1) gModelDir = argv[1];
+  gRows = makeRows();
+  for (const auto& row : gRows) gInterfaces.push_back(XgboostModel::arrayInterface(row));
+  try {
+    compareScores();
+  } catch (const std::exception& e) {
+    std::fprintf(stderr, "xgboost_bench: %s\n", e.what());
+    gPairs.clear();
+    return 2;
+  }
+  for (const char* name : kModels) {
+    benchmark::RegisterBenchmark((std::string("BM_Xgboost/") + name).c_str(), BM_Xgboost, name)
+        ->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark((std::string("BM_Reliqa/") + name).c_str(), BM_Reliqa, name)
+        ->Unit(benchmark::kMicrosecond);
+  }
+  RatioReporter reporter;
+  benchmark::RunSpecifiedBenchmarks(&reporter);
+  benchmark::Shutdown();
+  gPairs.clear();  // before the XGBoost library's own globals go away
+  return 0;
+}
