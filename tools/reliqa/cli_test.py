@@ -15,6 +15,7 @@ import os
 import re
 import select
 import shutil
+import sqlite3
 import struct
 import subprocess
 import sys
@@ -177,6 +178,20 @@ class ModelGuard(Tool):
                              pattern=pattern)
                 self.assertEqual(self.ok("model-id"), "good\n")
                 self.assertEqual(self.classify(collection()), before)
+
+    def test_a_store_holding_an_unloadable_model_can_be_repaired(self):
+        good = self.path("good.txt", model_text())
+        self.ok("set-model", "--model", good, "--model-id", "good", "--threshold", "0.25")
+        with sqlite3.connect(self.store) as db:  # as if written by some other means
+            db.execute("UPDATE entries SET value = ? WHERE key = 'RELIQA_model'",
+                       (model_text(tree_record=struct.pack("<d", 1.0) + b"X").encode(),))
+        self.refused("classify", self.path("c.json", collection()), pattern=r"the stored model cannot be loaded")
+        self.refused("set-model", "--model-id", "x", "--threshold", "0.5",
+                     pattern=r"give a replacement with --model FILE")
+        r = self.run_tool("set-model", "--model", good, "--model-id", "fixed", "--threshold", "0.5")
+        self.assertEqual(r.returncode, 0, r.stderr)
+        self.assertIn("replacing it", r.stderr)
+        self.assertEqual(self.classify(collection())["loggingData"]["model_id"], "fixed")
 
     def test_accepted_but_unusual_models_warn(self):
         r = self.run_tool("set-model", "--model", self.path("v7.txt", model_text(version=7)), "--model-id", "v7",

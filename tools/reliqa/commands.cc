@@ -13,6 +13,7 @@
 
 #include "host/keystash/PersistentKeyValueStore.h"
 #include "reliqaclassifier/FeatureExtraction.h"
+#include "reliqaclassifier/ModelParamsPersistence.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "tools/reliqa/collection_reader.h"
 #include "tools/reliqa/errors.h"
@@ -22,6 +23,7 @@
 #include "tools/reliqa/xgboost_model.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/CacheManager.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
@@ -31,6 +33,10 @@ namespace rc = kestrova::reliqaclassifier;
 using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
 
 namespace {
+
+// The classifier's fixed key prefix, needed only to repair a store whose model
+// no classifier can load.
+constexpr char kKeyPrefix[] = "RELIQA";
 
 void warn(const std::string& file, const std::string& what) {
   std::cerr << "reliqa: warning: " << (file.empty() ? "" : file + ": ") << what << std::endl;
@@ -55,8 +61,9 @@ std::shared_ptr<PersistentKeyValueStore> openStore(const std::string& path) {
   }
 }
 
-std::unique_ptr<rc::ReliqasClassifier> openClassifier(const std::string& storePath) {
-  auto store = openStore(storePath);
+std::unique_ptr<rc::ReliqasClassifier> openClassifier(const std::string& storePath,
+                                                      std::shared_ptr<PersistentKeyValueStore> store = nullptr) {
+  if (!store) store = openStore(storePath);
   try {
     return std::make_unique<rc::ReliqasClassifier>(store);
   } catch (const std::exception& e) {
@@ -143,7 +150,24 @@ void setModel(const SetModelOptions& o) {
       }
     }
   }
-  auto classifier = openClassifier(o.store);
+  auto store = openStore(o.store);
+  std::unique_ptr<rc::ReliqasClassifier> classifier;
+  try {
+    classifier = std::make_unique<rc::ReliqasClassifier>(store);
+  } catch (const std::exception& e) {
+    // The store holds a model that no classifier can load (written by some
+    // other means). A new model, checked above, replaces it; write the
+    // parameters as the classifier would, then make sure a classifier starts.
+    if (params.mSerializedModel.empty()) {
+      throw ToolError(o.store, 0,
+                      std::string("the stored model cannot be loaded (") + e.what() +
+                          "); give a replacement with --model FILE");
+    }
+    warn(o.store, std::string("the stored model cannot be loaded (") + e.what() + "); replacing it");
+    thornvale::CacheManager cache(store, kKeyPrefix);
+    rc::storeModelParams(cache, params);
+    classifier = openClassifier(o.store, store);
+  }
   try {
     classifier->setModelParams(params);
   } catch (const std::exception& e) {
