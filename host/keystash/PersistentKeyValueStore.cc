@@ -1,17 +1,70 @@
 #include "host/keystash/PersistentKeyValueStore.h"
 
+#include <fcntl.h>
 #include <sqlite3.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
+#include <cstdint>
 #include <mutex>
 #include <stdexcept>
+#include <unordered_map>
 #include <utility>
 
 namespace kestrova::mobile::xplat::keystash {
+namespace {
+
+// A 64-bit counter in a small file beside the database, mapped into memory and
+// shared by every store over that database in every process. Each completed
+// write increments it, so a store can tell without any system call whether the
+// entries it has cached may be out of date.
+class ChangeCounter {
+ public:
+  // Null when the counter file cannot be set up; the store then reads the
+  // database every time.
+  static std::unique_ptr<ChangeCounter> open(const std::string& path) {
+    int fd = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
+    if (fd < 0) return nullptr;
+    struct stat info;
+    void* mapping = MAP_FAILED;
+    if (fstat(fd, &info) == 0 &&
+        (info.st_size >= static_cast<off_t>(sizeof(uint64_t)) || ftruncate(fd, sizeof(uint64_t)) == 0)) {
+      mapping = mmap(nullptr, sizeof(uint64_t), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
+    }
+    ::close(fd);
+    if (mapping == MAP_FAILED) return nullptr;
+    return std::unique_ptr<ChangeCounter>(new ChangeCounter(static_cast<uint64_t*>(mapping)));
+  }
+
+  ~ChangeCounter() { munmap(value_, sizeof(uint64_t)); }
+  ChangeCounter(const ChangeCounter&) = delete;
+  ChangeCounter& operator=(const ChangeCounter&) = delete;
+
+  uint64_t load() const { return __atomic_load_n(value_, __ATOMIC_SEQ_CST); }
+  // Returns the value before the increment.
+  uint64_t increment() { return __atomic_fetch_add(value_, 1, __ATOMIC_SEQ_CST); }
+
+ private:
+  explicit ChangeCounter(uint64_t* value) : value_(value) {}
+  uint64_t* value_;
+};
+
+// More distinct keys than this and the cache starts over.
+constexpr size_t kMaxCachedKeys = 1024;
+// Larger values (model texts) are read when asked for, never kept.
+constexpr size_t kMaxCachedValueBytes = 64 * 1024;
+
+bool cacheable(const std::optional<PersistentKeyValueStore::Entry>& entry) {
+  return !entry || entry->data.size() + entry->extra.size() <= kMaxCachedValueBytes;
+}
+
+}  // namespace
 
 // One SQLite connection with its two prepared statements, used under `mutex`.
 class PersistentKeyValueStore::Database {
  public:
-  explicit Database(const std::string& path) : path_(path) {
+  explicit Database(const std::string& path) : path_(path), counter_(ChangeCounter::open(path + "-changes")) {
     int rc = sqlite3_open_v2(path.c_str(), &db_,
                              SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
     if (rc != SQLITE_OK) {
@@ -40,8 +93,45 @@ class PersistentKeyValueStore::Database {
 
   ~Database() { close(); }
 
+  // Served from the cache while no write has completed since it was filled
+  // (the change counter is read before the database, so a write that lands
+  // in between only makes the cache newer than its mark, never older).
   std::optional<Entry> fetch(const std::string& key) {
     std::lock_guard<std::mutex> lock(mutex_);
+    if (!counter_) return read(key);
+    const uint64_t changes = counter_->load();
+    if (changes != cachedChanges_ || cache_.size() >= kMaxCachedKeys) {
+      cache_.clear();
+      cachedChanges_ = changes;
+    }
+    auto cached = cache_.find(key);
+    if (cached != cache_.end()) return cached->second;
+    std::optional<Entry> entry = read(key);
+    if (cacheable(entry)) cache_.emplace(key, entry);
+    return entry;
+  }
+
+  void store(const std::string& key, const FileUtils::BinaryData& value, const FileUtils::BinaryData& extra) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    write(key, value, extra);
+    if (!counter_) return;
+    // Committed: announce it. When nobody else wrote since the cache was
+    // filled, the cache stays valid with this entry replaced.
+    if (counter_->increment() == cachedChanges_) {
+      ++cachedChanges_;
+      std::optional<Entry> entry = Entry{value, extra.toString()};
+      if (cacheable(entry)) {
+        cache_[key] = std::move(entry);
+      } else {
+        cache_.erase(key);
+      }
+    } else {
+      cache_.clear();
+    }
+  }
+
+ private:
+  std::optional<Entry> read(const std::string& key) {
     Reset reset{select_};
     bindText(select_, 1, key);
     int rc = sqlite3_step(select_);
@@ -55,8 +145,7 @@ class PersistentKeyValueStore::Database {
     return entry;
   }
 
-  void store(const std::string& key, const FileUtils::BinaryData& value, const FileUtils::BinaryData& extra) {
-    std::lock_guard<std::mutex> lock(mutex_);
+  void write(const std::string& key, const FileUtils::BinaryData& value, const FileUtils::BinaryData& extra) {
     Reset reset{upsert_};
     bindText(upsert_, 1, key);
     bindBlob(upsert_, 2, value);
@@ -64,7 +153,6 @@ class PersistentKeyValueStore::Database {
     if (sqlite3_step(upsert_) != SQLITE_DONE) fail("store", key);
   }
 
- private:
   // Leaves a statement ready for its next use, whatever happened.
   struct Reset {
     sqlite3_stmt* statement;
@@ -119,7 +207,10 @@ class PersistentKeyValueStore::Database {
   }
 
   std::string path_;
+  std::unique_ptr<ChangeCounter> counter_;
   std::mutex mutex_;
+  std::unordered_map<std::string, std::optional<Entry>> cache_;
+  uint64_t cachedChanges_ = UINT64_MAX;  // counter value that cache_ is current for
   sqlite3* db_ = nullptr;
   sqlite3_stmt* select_ = nullptr;
   sqlite3_stmt* upsert_ = nullptr;

@@ -13,6 +13,11 @@
 //   - Both complete before they return; failures (an unreadable or read-only
 //     database, a full disk, a database locked by another process for more than
 //     five seconds) arrive as std::runtime_error from the future's get().
+//   - Reads are cheap: small entries are kept in memory and served from there
+//     until any store object over the file (in any process) completes a write,
+//     which it announces through a counter in the file "<databasePath>-changes".
+//     Write the database only through this class, or other live stores may go
+//     on serving what they had read.
 //
 // Thread-safety: any number of threads may call fetch and store at once; calls
 // on one object are serialised internally. Several objects, also in several

@@ -54,12 +54,15 @@ TEST(PersistentKeyValueStoreTest, ValuesSurviveNewObjectsAndAKilledProcess) {
     PersistentKeyValueStore store(path);
     write(store, "before", "1");
   }
+  PersistentKeyValueStore parentStore(path);
+  EXPECT_EQ(read(parentStore, "before"), "1");  // now kept in memory
   pid_t child = fork();
   ASSERT_GE(child, 0);
   if (child == 0) {
     // The write has completed when get() returns; die without any clean-up.
     PersistentKeyValueStore store(path);
     write(store, "from-child", "written then killed");
+    write(store, "before", "2");
     raise(SIGKILL);
     _exit(1);
   }
@@ -67,9 +70,26 @@ TEST(PersistentKeyValueStoreTest, ValuesSurviveNewObjectsAndAKilledProcess) {
   ASSERT_EQ(waitpid(child, &status, 0), child);
   ASSERT_TRUE(WIFSIGNALED(status));
 
+  EXPECT_EQ(read(parentStore, "before"), "2");  // a live store sees the other process's write
   PersistentKeyValueStore reopened(path);
-  EXPECT_EQ(read(reopened, "before"), "1");
+  EXPECT_EQ(read(reopened, "before"), "2");
   EXPECT_EQ(read(reopened, "from-child"), "written then killed");
+}
+
+TEST(PersistentKeyValueStoreTest, StoresOverOneFileSeeEachOthersWrites) {
+  TemporaryDirectory dir;
+  PersistentKeyValueStore first(dir.file("kv.db"));
+  PersistentKeyValueStore second(dir.file("kv.db"));
+  EXPECT_EQ(read(second, "k"), std::nullopt);
+  write(first, "k", "1");
+  EXPECT_EQ(read(second, "k"), "1");
+  EXPECT_EQ(read(first, "k"), "1");
+  write(second, "k", "2");
+  EXPECT_EQ(read(first, "k"), "2");
+  write(first, "big", std::string(200000, 'm'));  // too big to keep in memory, read each time
+  EXPECT_EQ(read(second, "big"), std::string(200000, 'm'));
+  write(second, "big", "small");
+  EXPECT_EQ(read(first, "big"), "small");
 }
 
 TEST(PersistentKeyValueStoreTest, ConcurrentWritersNeverTearAValue) {
