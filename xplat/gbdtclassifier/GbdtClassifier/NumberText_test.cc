@@ -1,10 +1,12 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
+#include <double-conversion/double-conversion.h>
 #include <gtest/gtest.h>
 
 #include <cfloat>
 #include <cmath>
 #include <limits>
+#include <random>
 #include <string>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
@@ -56,6 +58,24 @@ TEST(NumberTextTest, WritesShortestTextWithoutTrailingZeroAndCapitalExponent) {
   std::string appended = "x=";
   appendDoubleText(2.5, appended);
   EXPECT_EQ(appended, "x=2.5");
+}
+
+TEST(NumberTextTest, IntegralValuesGiveTheSameTextAsTheGeneralConversion) {
+  double_conversion::DoubleToStringConverter reference(double_conversion::DoubleToStringConverter::NO_FLAGS,
+                                                       "Infinity", "NaN", 'E', -6, 21, 6, 1);
+  auto referenceText = [&reference](double value) {
+    char buffer[64];
+    double_conversion::StringBuilder builder(buffer, sizeof buffer);
+    reference.ToShortest(value, &builder);
+    return std::string(buffer, static_cast<size_t>(builder.position()));
+  };
+  std::vector<double> values = {-0.0, 1.0, -1.0, 9007199254740991.0, -9007199254740991.0, 9007199254740992.0,
+                                9007199254740994.0, 1e15, 1e16, 123456789012345.0, 4503599627370497.0};
+  std::mt19937_64 rng(1);
+  for (int i = 0; i < 2000; ++i) {
+    values.push_back(static_cast<double>(static_cast<int64_t>(rng() >> (11 + i % 50))) * (i % 2 ? -1 : 1));
+  }
+  for (double value : values) EXPECT_EQ(doubleToText(value), referenceText(value)) << value;
 }
 
 TEST(NumberTextTest, ReadsDoublesWithSpaceWordsAndOutOfRangeExponents) {
