@@ -11,6 +11,15 @@ constexpr double kUncalculatedMetric = 100.0;
 // Modification date of an asset whose modification is unknown.
 constexpr time_t kUnknownDate = -1;
 
+// Seconds from creation to modification: the exact difference, rounded once
+// to double (which is what difftime gives, and what the plain subtraction
+// gives whenever it cannot overflow).
+double editDelayOf(time_t created, time_t modified) {
+  time_t delay;
+  if (!__builtin_sub_overflow(modified, created, &delay)) return static_cast<double>(delay);
+  return difftime(modified, created);
+}
+
 }  // namespace
 
 CollectionStatistics gatherCollectionStatistics(const ReliqaClassifierInput& input) {
@@ -31,7 +40,7 @@ CollectionStatistics gatherCollectionStatistics(const ReliqaClassifierInput& inp
     const time_t created = asset.creationDateSinceEpoch;
     const time_t modified = asset.modificationDateSinceEpoch;
     const bool modificationKnown = modified != kUnknownDate;
-    const double editDelay = difftime(modified, created);  // exact difference, rounded once
+    const double editDelay = editDelayOf(created, modified);
 
     stats.creationDates.push_back(static_cast<double>(created));
     std::tm local{};

@@ -8,13 +8,23 @@ namespace {
 
 using thornvale::FeatureMap;
 
-// Initial bucket count of every map built here.
+// Initial bucket count of the feature map.
 constexpr size_t kBucketHint = 10;
 
+// The features come in seven groups with disjoint ids; each group adds its
+// features to the map.
+
+// Adds mean and standard deviation of `values` as `meanId` and `meanId + 1`.
+template <typename T>
+void addMeanAndDeviation(FeatureMap& features, int32_t meanId, const std::vector<T>& values) {
+  const MeanAndDeviation summary = meanAndDeviation(values);
+  features.emplace(meanId, summary.mean);
+  features.emplace(meanId + 1, summary.deviation);
+}
+
 // Features 3 to 12: the asset counts, in their declaration order.
-FeatureMap countsGroup(const ReliqaClassifierInput& input) {
+void addCounts(FeatureMap& features, const ReliqaClassifierInput& input) {
   const AssetCounts& counts = input.assetCounts;
-  FeatureMap features(kBucketHint);
   features.emplace(3, counts.tileCount);
   features.emplace(4, counts.totalAssetsCount);
   features.emplace(5, counts.photosCount);
@@ -25,33 +35,25 @@ FeatureMap countsGroup(const ReliqaClassifierInput& input) {
   features.emplace(10, counts.totalAssetsWithinLoopsCount);
   features.emplace(11, counts.facesCount);
   features.emplace(12, counts.photosWithFacesCount);
-  return features;
 }
 
 // Feature 2 (landmark, only with a location) and 31 to 34 (asset positions).
-FeatureMap locationGroup(const ReliqaClassifierInput& input, const CollectionStatistics& stats) {
-  FeatureMap features(kBucketHint);
+void addLocation(FeatureMap& features, const ReliqaClassifierInput& input, const CollectionStatistics& stats) {
   if (input.locationInfo) features.emplace(2, input.locationInfo->isLandmark ? 1.0 : 0.0);
-  features.emplace(31, mean(stats.latitudes));
-  features.emplace(32, standardDeviation(stats.latitudes));
-  features.emplace(33, mean(stats.longitudes));
-  features.emplace(34, standardDeviation(stats.longitudes));
-  return features;
+  addMeanAndDeviation(features, 31, stats.latitudes);
+  addMeanAndDeviation(features, 33, stats.longitudes);
 }
 
 // Features 1, 35 to 47 and 71 to 73: story recency, dates, hours, edits.
-FeatureMap timeGroup(const ReliqaClassifierInput& input, const CollectionStatistics& stats) {
-  FeatureMap features(kBucketHint);
+void addTime(FeatureMap& features, const ReliqaClassifierInput& input, const CollectionStatistics& stats) {
   features.emplace(1, input.timeSinceStory);
   features.emplace(35, standardDeviation(stats.creationDates));
   features.emplace(36, range(stats.creationDates));
   features.emplace(37, standardDeviation(stats.modificationDates));
   features.emplace(38, standardDeviation(stats.knownModificationDates));
   features.emplace(39, range(stats.knownModificationDates));
-  features.emplace(40, mean(stats.knownEditDelays));
-  features.emplace(41, standardDeviation(stats.knownEditDelays));
-  features.emplace(42, mean(stats.creationHours));
-  features.emplace(43, standardDeviation(stats.creationHours));
+  addMeanAndDeviation(features, 40, stats.knownEditDelays);
+  addMeanAndDeviation(features, 42, stats.creationHours);
   features.emplace(44, minimum(stats.creationHours));
   features.emplace(45, maximum(stats.creationHours));
   features.emplace(46, mode(stats.creationHours));
@@ -60,68 +62,51 @@ FeatureMap timeGroup(const ReliqaClassifierInput& input, const CollectionStatist
   features.emplace(71, assets == 0 ? -1.0
                                    : static_cast<double>(stats.knownModificationDates.size()) * 100.0 /
                                          static_cast<double>(assets));
-  features.emplace(72, mean(stats.editDelays));
-  features.emplace(73, standardDeviation(stats.editDelays));
-  return features;
+  addMeanAndDeviation(features, 72, stats.editDelays);
 }
 
 // Features 13 to 18 (media subtypes, source types) and 74 (extra count).
-FeatureMap mediaGroup(const ReliqaClassifierInput& input, const CollectionStatistics& stats) {
-  FeatureMap features(kBucketHint);
-  features.emplace(13, mean(stats.mediaSubtypes));
-  features.emplace(14, standardDeviation(stats.mediaSubtypes));
+void addMedia(FeatureMap& features, const ReliqaClassifierInput& input, const CollectionStatistics& stats) {
+  addMeanAndDeviation(features, 13, stats.mediaSubtypes);
   features.emplace(15, mode(stats.mediaSubtypes));
-  features.emplace(16, mean(stats.sourceTypes));
-  features.emplace(17, standardDeviation(stats.sourceTypes));
+  addMeanAndDeviation(features, 16, stats.sourceTypes);
   features.emplace(18, mode(stats.sourceTypes));
   features.emplace(74, static_cast<double>(input.extraCount));
-  return features;
 }
 
 // Features 19 to 24: favourite and hidden flags.
-FeatureMap flagsGroup(const CollectionStatistics& stats) {
-  FeatureMap features(kBucketHint);
-  features.emplace(19, mean(stats.favoriteFlags));
-  features.emplace(20, standardDeviation(stats.favoriteFlags));
+void addFlags(FeatureMap& features, const CollectionStatistics& stats) {
+  addMeanAndDeviation(features, 19, stats.favoriteFlags);
   features.emplace(21, mode(stats.favoriteFlags));
-  features.emplace(22, mean(stats.hiddenFlags));
-  features.emplace(23, standardDeviation(stats.hiddenFlags));
+  addMeanAndDeviation(features, 22, stats.hiddenFlags);
   features.emplace(24, mode(stats.hiddenFlags));
-  return features;
 }
 
 // Features 48 to 59 and 61 to 70: image metrics and duplicate coefficients.
-FeatureMap qualityGroup(const CollectionStatistics& stats) {
-  FeatureMap features(kBucketHint);
-  auto describe = [&features](int firstId, const std::vector<double>& values) {
-    features.emplace(firstId, mean(values));
-    features.emplace(firstId + 1, standardDeviation(values));
+void addQuality(FeatureMap& features, const CollectionStatistics& stats) {
+  auto describe = [&features](int32_t firstId, const std::vector<double>& values) {
+    addMeanAndDeviation(features, firstId, values);
     features.emplace(firstId + 2, minimum(values));
     features.emplace(firstId + 3, maximum(values));
     features.emplace(firstId + 4, range(values));
   };
   describe(48, stats.calculatedBlurriness);
   describe(53, stats.calculatedDarkness);
-  features.emplace(58, mean(stats.duplicateCoefficients));
-  features.emplace(59, standardDeviation(stats.duplicateCoefficients));
+  addMeanAndDeviation(features, 58, stats.duplicateCoefficients);
   describe(61, stats.blurriness);
   describe(66, stats.darkness);
-  return features;
 }
 
 // Features 25 to 30 and 60: pixel sizes and video durations.
-FeatureMap sizeGroup(const CollectionStatistics& stats) {
-  FeatureMap features(kBucketHint);
-  const double meanWidth = mean(stats.widths);
-  const double meanHeight = mean(stats.heights);
-  features.emplace(25, meanWidth);
-  features.emplace(26, standardDeviation(stats.widths));
-  features.emplace(27, meanHeight);
-  features.emplace(28, standardDeviation(stats.heights));
-  features.emplace(29, mean(stats.videoDurations));
-  features.emplace(30, standardDeviation(stats.videoDurations));
-  features.emplace(60, meanWidth * meanHeight);  // 1.0 without assets: (-1) * (-1)
-  return features;
+void addSize(FeatureMap& features, const CollectionStatistics& stats) {
+  const MeanAndDeviation widths = meanAndDeviation(stats.widths);
+  const MeanAndDeviation heights = meanAndDeviation(stats.heights);
+  features.emplace(25, widths.mean);
+  features.emplace(26, widths.deviation);
+  features.emplace(27, heights.mean);
+  features.emplace(28, heights.deviation);
+  addMeanAndDeviation(features, 29, stats.videoDurations);
+  features.emplace(60, widths.mean * heights.mean);  // 1.0 without assets: (-1) * (-1)
 }
 
 }  // namespace
@@ -129,11 +114,13 @@ FeatureMap sizeGroup(const CollectionStatistics& stats) {
 FeatureMap extractFeatures(const ReliqaClassifierInput& input) {
   const CollectionStatistics stats = gatherCollectionStatistics(input);
   FeatureMap features(kBucketHint);
-  // The groups' ids are disjoint; merge moves their nodes without copying.
-  FeatureMap groups[] = {countsGroup(input),       locationGroup(input, stats), timeGroup(input, stats),
-                         mediaGroup(input, stats), flagsGroup(stats),           qualityGroup(stats),
-                         sizeGroup(stats)};
-  for (FeatureMap& group : groups) features.merge(group);
+  addCounts(features, input);
+  addLocation(features, input, stats);
+  addTime(features, input, stats);
+  addMedia(features, input, stats);
+  addFlags(features, stats);
+  addQuality(features, stats);
+  addSize(features, stats);
   return features;
 }
 

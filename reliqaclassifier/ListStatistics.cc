@@ -21,15 +21,15 @@ double meanOf(const std::vector<T>& values) {
 }
 
 template <typename T>
-double deviationOf(const std::vector<T>& values) {
-  if (values.empty()) return kEmpty;
+MeanAndDeviation meanAndDeviationOf(const std::vector<T>& values) {
+  if (values.empty()) return {kEmpty, kEmpty};
   const double average = meanOf(values);
   double sumOfSquares = 0.0;
   for (T value : values) {
     const double difference = static_cast<double>(value) - average;
     sumOfSquares += difference * difference;
   }
-  return std::sqrt(sumOfSquares / static_cast<double>(values.size()));
+  return {average, std::sqrt(sumOfSquares / static_cast<double>(values.size()))};
 }
 
 template <typename T>
@@ -45,12 +45,11 @@ double maximumOf(const std::vector<T>& values) {
 }
 
 // The smallest of the most frequent values, counted in a dense histogram of
-// the span [lowest, lowest + span).
-double denseMode(const std::vector<int32_t>& values, int32_t lowest, int64_t span) {
-  std::vector<uint32_t> counts(static_cast<size_t>(span), 0);
+// the span [lowest, lowest + span) at `counts` (zeroed).
+double denseMode(const std::vector<int32_t>& values, int32_t lowest, size_t span, uint32_t* counts) {
   for (int32_t value : values) ++counts[static_cast<size_t>(int64_t{value} - lowest)];
   size_t best = 0;
-  for (size_t i = 1; i < counts.size(); ++i) {
+  for (size_t i = 1; i < span; ++i) {
     if (counts[i] > counts[best]) best = i;
   }
   return static_cast<double>(int64_t{lowest} + static_cast<int64_t>(best));
@@ -77,8 +76,10 @@ double sortedMode(std::vector<int32_t> values) {
 
 double mean(const std::vector<double>& values) { return meanOf(values); }
 double mean(const std::vector<int32_t>& values) { return meanOf(values); }
-double standardDeviation(const std::vector<double>& values) { return deviationOf(values); }
-double standardDeviation(const std::vector<int32_t>& values) { return deviationOf(values); }
+double standardDeviation(const std::vector<double>& values) { return meanAndDeviationOf(values).deviation; }
+double standardDeviation(const std::vector<int32_t>& values) { return meanAndDeviationOf(values).deviation; }
+MeanAndDeviation meanAndDeviation(const std::vector<double>& values) { return meanAndDeviationOf(values); }
+MeanAndDeviation meanAndDeviation(const std::vector<int32_t>& values) { return meanAndDeviationOf(values); }
 double minimum(const std::vector<double>& values) { return minimumOf(values); }
 double minimum(const std::vector<int32_t>& values) { return minimumOf(values); }
 double maximum(const std::vector<double>& values) { return maximumOf(values); }
@@ -100,9 +101,19 @@ double mode(const std::vector<int32_t>& values) {
   auto [lowest, highest] = std::minmax_element(values.begin(), values.end());
   const int64_t span = int64_t{*highest} - int64_t{*lowest} + 1;
   if (span >= kMaxModeSpan) throw std::bad_alloc();
-  // A histogram a few times the list's size is cheapest; wider spans are
-  // sparse and sorting gives the same answer in memory linear in the list.
-  if (span <= static_cast<int64_t>(4 * values.size() + 1024)) return denseMode(values, *lowest, span);
+  // A histogram a few times the list's size is cheapest (on the stack when
+  // small: flags, hours and subtype codes); wider spans are sparse, and
+  // sorting gives the same answer in memory linear in the list.
+  constexpr size_t kStackCounters = 256;
+  if (span <= static_cast<int64_t>(kStackCounters)) {
+    uint32_t counts[kStackCounters];
+    std::fill_n(counts, static_cast<size_t>(span), 0u);
+    return denseMode(values, *lowest, static_cast<size_t>(span), counts);
+  }
+  if (span <= static_cast<int64_t>(4 * values.size() + 1024)) {
+    std::vector<uint32_t> counts(static_cast<size_t>(span), 0);
+    return denseMode(values, *lowest, counts.size(), counts.data());
+  }
   return sortedMode(values);
 }
 

@@ -27,6 +27,14 @@ double mean(const std::vector<int32_t>& values);
 double standardDeviation(const std::vector<double>& values);
 double standardDeviation(const std::vector<int32_t>& values);
 
+// mean and standardDeviation together, the mean computed once.
+struct MeanAndDeviation {
+  double mean;
+  double deviation;
+};
+MeanAndDeviation meanAndDeviation(const std::vector<double>& values);
+MeanAndDeviation meanAndDeviation(const std::vector<int32_t>& values);
+
 double minimum(const std::vector<double>& values);
 double minimum(const std::vector<int32_t>& values);
 

@@ -24,11 +24,13 @@ ReliqasClassifier::ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> st
 ReliqasClassifier::~ReliqasClassifier() = default;
 
 ReliqaClassifierResult ReliqasClassifier::classify(const ReliqaClassifierInput& input) {
-  const FeatureMap computed = extractFeatures(input);  // outside the lock: pure and reentrant
+  FeatureMap features = extractFeatures(input);  // outside the lock: pure and reentrant
   std::lock_guard<std::mutex> lock(mutex);
-  FeatureMap merged = fetchServerFeatures(serverFeaturesCache);
-  merged.insert(computed.begin(), computed.end());  // a server feature keeps its id
-  return buildResult(merged, model.get(), modelParamsCache);
+  // A server feature replaces the computed feature of its id. (Same content as
+  // inserting the computed features into the server's map where absent, without
+  // copying the computed ones.)
+  for (const auto& [id, value] : fetchServerFeatures(serverFeaturesCache)) features.insert_or_assign(id, value);
+  return buildResult(features, model.get(), modelParamsCache);
 }
 
 void ReliqasClassifier::setModelParams(const ReliqaClassifierModelParams& params) {
