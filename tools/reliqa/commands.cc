@@ -221,6 +221,7 @@ void features(const std::string& input, ResultWriter& out) {
 }
 
 void score(const std::string& modelPath, const std::string& rows, bool raw, ResultWriter& out) {
+  if (modelPath == "-" && rows == "-") throw UsageError("the model and the rows cannot both come from standard input");
   auto model = loadModel(displayName(modelPath), readFile(modelPath));
   LineReader lines(rows, &out);
   std::string line;
@@ -265,6 +266,9 @@ void pdp(const PdpOptions& o, ResultWriter& out) {
 void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
   std::string name = displayName(o.input);
   std::vector<int64_t> given = o.featureIds.empty() ? std::vector<int64_t>{} : parseIdList(o.featureIds);
+  if (o.input.size() > 4 && o.input.compare(o.input.size() - 4, 4, ".ubj") == 0) {
+    throw ToolError(name, 0, "binary (UBJSON) models cannot be read; save the model as JSON: save_model(\"model.json\")");
+  }
   XgbModel xgb = readXgboostModel(readFile(o.input), name);
   std::vector<int32_t> ids = featureIdsOf(xgb, given, name);
   std::unique_ptr<thornvale::Forest> forest = toForest(xgb, ids);

@@ -52,6 +52,7 @@ int main(int argc, char** argv) {
       "Model parameters and server features live in a persistent store (SQLite); results go to\n"
       "standard output, messages to standard error. Exit status 2 means the input was refused."};
   app.name("reliqa");
+  app.footer("Run 'reliqa COMMAND --help' for the details of a command.");
   app.require_subcommand(1);
   std::string store;
   bool verbose = false;
@@ -62,9 +63,8 @@ int main(int argc, char** argv) {
 
   SetModelOptions setModelOptions;
   std::string modelFile;
-  auto* setModelCmd = app.add_subcommand(
-      "set-model",
-      "Store model parameters (as the managed setModelParams call does). The model is loaded here first: a model "
+  auto* setModelCmd = app.add_subcommand("set-model", "Store a model, its identifier and its threshold")->footer(
+      "Store model parameters (as the app's setModelParams call does). The model is loaded here first: a model "
       "the classifier would reject is never stored.\nExample: reliqa set-model --model model.txt --model-id v7 "
       "--threshold 0.5");
   auto* modelOpt = setModelCmd->add_option("--model", modelFile,
@@ -76,19 +76,17 @@ int main(int argc, char** argv) {
       ->required();
 
   std::string serverFeaturesFile;
-  auto* serverCmd = app.add_subcommand(
-      "set-server-features",
+  auto* serverCmd = app.add_subcommand("set-server-features", "Replace the stored server features")->footer(
       "Replace the stored server features. FILE holds a JSON object of feature-id text to number text, like the "
-      "managed map ({\"12\": \"0.5\"}); keys are read by the C atoi rules, values by strtod, the first key for an "
+      "app's map ({\"12\": \"0.5\"}); keys are read by the C atoi rules, values by strtod, the first key for an "
       "id wins, keys beyond 32 bits are dropped with a warning.\nExample: reliqa set-server-features "
       "server_features.json");
   serverCmd->add_option("FILE", serverFeaturesFile, "JSON file (- for standard input)")->required();
 
-  auto* modelIdCmd = app.add_subcommand("model-id", "Print the stored model identifier.");
+  auto* modelIdCmd = app.add_subcommand("model-id", "Print the stored model identifier");
 
   std::string classifyInput;
-  auto* classifyCmd = app.add_subcommand(
-      "classify",
+  auto* classifyCmd = app.add_subcommand("classify", "Classify collections with the stored parameters")->footer(
       "Classify a collection with the stored parameters; prints {\"score\":S,\"isOverThreshold\":B,"
       "\"loggingData\":{...}} on one line. With -, reads JSON Lines (one collection per line) and answers each "
       "line as it arrives. Hour features use the process's time zone (TZ).\nExample: reliqa classify "
@@ -97,8 +95,7 @@ int main(int argc, char** argv) {
       ->required();
 
   std::string featuresInput;
-  auto* featuresCmd = app.add_subcommand(
-      "features",
+  auto* featuresCmd = app.add_subcommand("features", "Print the computed features of collections")->footer(
       "Print the computed features of a collection as a compact JSON object (no store needed). With -, reads "
       "JSON Lines.\nExample: reliqa features collection.json");
   featuresCmd->add_option("FILE", featuresInput, "collection JSON file, or - for JSON Lines on standard input")
@@ -106,8 +103,7 @@ int main(int argc, char** argv) {
 
   std::string scoreModel, scoreRows = "-";
   bool raw = false;
-  auto* scoreCmd = app.add_subcommand(
-      "score",
+  auto* scoreCmd = app.add_subcommand("score", "Score feature rows with a model (no store)")->footer(
       "Score feature rows with a model, no store: each input line is a JSON object of feature id to number "
       "({\"3\":0.25,\"17\":-1}); each output line is the score. Absent features read as 0.\nExample: reliqa "
       "score --model model.txt rows.jsonl");
@@ -117,8 +113,7 @@ int main(int argc, char** argv) {
 
   InspectOptions inspectOptions;
   int64_t treeIndex = 0;
-  auto* inspectCmd = app.add_subcommand(
-      "inspect",
+  auto* inspectCmd = app.add_subcommand("inspect", "Summarise or print a model")->footer(
       "Summarise a model text: format version, trees kept and dropped, depths and leaves, base score, input keys, "
       "feature mapping, equality features, selector and sub-models, 16- or 32-bit compiled forest.\nExample: "
       "reliqa inspect model.txt --tree 0");
@@ -129,8 +124,7 @@ int main(int argc, char** argv) {
 
   PdpOptions pdpOptions;
   std::string pdpFeatures, pdpSvg;
-  auto* pdpCmd = app.add_subcommand(
-      "pdp",
+  auto* pdpCmd = app.add_subcommand("pdp", "Partial dependence of the raw score on one feature")->footer(
       "Partial dependence: the raw score as one feature sweeps --steps values from --from to --to, the other "
       "features from --features (else 0). Computed on the model's trees with comparisons in double, as the "
       "tree nodes compare (the compiled forest used by score and classify compares floats). Prints CSV; models "
@@ -144,11 +138,10 @@ int main(int argc, char** argv) {
   auto* pdpFeaturesOpt = pdpCmd->add_option("--features", pdpFeatures, "JSON object of the other features' values");
   auto* pdpSvgOpt = pdpCmd->add_option("--svg", pdpSvg, "also draw the curve as an SVG line chart into this file");
 
-  auto* convertCmd = app.add_subcommand("convert", "Convert a model from another trainer.");
+  auto* convertCmd = app.add_subcommand("convert", "Convert a model from another trainer");
   convertCmd->require_subcommand(1);
   ConvertOptions convertOptions;
-  auto* xgboostCmd = convertCmd->add_subcommand(
-      "xgboost",
+  auto* xgboostCmd = convertCmd->add_subcommand("xgboost", "Convert an XGBoost JSON model")->footer(
       "Convert an XGBoost JSON model (gbtree booster, binary:logistic or reg:logistic) into a model text of "
       "format version 4. XGBoost's `x < split` becomes `x <= t` with t the largest float below the split, the "
       "base score the logit of base_score. Missing values cannot be represented: a converted model sends NaN by "
