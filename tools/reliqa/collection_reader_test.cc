@@ -85,6 +85,7 @@ TEST(CollectionReader, TypeErrorsNameTheMemberAndItsLine) {
   EXPECT_THAT(errorOf(wide), HasSubstr("isFavorite: integer 3000000000 is out of range"));
   EXPECT_THAT(errorOf(collection("", "true")), HasSubstr("locationInfo: expected an object, got a boolean"));
   EXPECT_THAT(errorOf("[1, 2]"), HasSubstr("f.json:1: expected a collection (a JSON object), got an array"));
+  EXPECT_THAT(errorOf("\n56"), HasSubstr("f.json:2: expected a collection (a JSON object), got a number"));
 }
 
 TEST(CollectionReader, MembersMustBeKnownPresentAndUnique) {
@@ -101,7 +102,9 @@ TEST(CollectionReader, MalformedJsonIsAnErrorWithAPosition) {
   std::string c = collection(kAsset);
   EXPECT_THAT(errorOf(c + "\n\n  x"), HasSubstr("f.json:8: unexpected text after the end"));
   EXPECT_THAT(errorOf(c.substr(0, c.size() / 2)), HasSubstr("f.json:"));
-  EXPECT_THAT(errorOf(""), HasSubstr("f.json:1: "));
+  EXPECT_THAT(errorOf(""), HasSubstr("f.json:1: no JSON value"));
+  EXPECT_THAT(errorOf("{\n\"a\\"), HasSubstr("f.json:2: unterminated string"));
+  EXPECT_THAT(errorOf("{\"collectionID\": [}"), HasSubstr("f.json:1: unexpected '}'"));
   EXPECT_THAT(errorOf("{\"collectionID\": \"\xff\"}"), HasSubstr("UTF-8"));
   EXPECT_THAT(errorOf(std::string(5000, '[') + std::string(5000, ']')), HasSubstr("f.json:1: "));
 }

@@ -91,13 +91,14 @@ void JsonDoc::scanStructure() {
   auto space = [](char c) { return c == ' ' || c == '\n' || c == '\r' || c == '\t'; };
   while (p < end && space(*p)) ++p;
   if (p == end) fail(p, "no JSON value (the input is empty)");
+  if (*p != '{' && *p != '[') return;  // a scalar: the type check reports it
   std::vector<const char*> open;  // positions of the open brackets
   do {
     char c = *p;
     if (c == '"') {
       const char* start = p++;
-      while (p < end && *p != '"') p += *p == '\\' ? 2 : 1;
-      if (p >= end) fail(start, "unterminated string");
+      while (p < end && *p != '"') p += (*p == '\\' && end - p > 1) ? 2 : 1;
+      if (p == end) fail(start, "unterminated string");
     } else if (c == '{' || c == '[') {
       open.push_back(p);
     } else if (c == '}' || c == ']') {
