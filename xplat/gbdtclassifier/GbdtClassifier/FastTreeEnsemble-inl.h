@@ -99,6 +99,8 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   struct FlatTree {
     std::vector<FlatNode> nodes;  // root at index 0
     bool hasEqualityFeature = false;
+    uint32_t depth = 0;      // splits on the longest root-to-leaf path
+    uint32_t leafDepth = 0;  // splits on the shortest root-to-leaf path
   };
 
   static constexpr FeatureIdT kLeaf = -1;
@@ -166,9 +168,21 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     return static_cast<size_t>(position) < equalityMask_.size() && equalityMask_[position];
   }
 
+  // Work list of compileTree, kept across trees.
+  struct Pending {
+    const Node* node;
+    size_t slot;
+    uint32_t depth;
+  };
+  static constexpr size_t kSelector = std::numeric_limits<size_t>::max();
+  static std::string label(size_t tree) {
+    return tree == kSelector ? "model selector tree" : "tree " + std::to_string(tree);
+  }
+
   void buildEqualityMask(const Forest& forest, bool remap);
-  int32_t checkedPosition(int32_t featureId, const std::string& label) const;
-  void compileTree(const Node& root, double scale, FlatTree& out, const std::string& label);
+  int32_t checkedPosition(int32_t featureId, size_t tree) const;
+  void compileTree(const Node& root, double scale, FlatTree& out, size_t tree,
+                   std::vector<Pending>& pending);
 
   // Selector walk result as a model number: truncation toward zero, NaN and
   // negative values give 0, values beyond the range the largest value.
@@ -230,34 +244,59 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     return sum;
   }
 
-  // Walks kBlock trees in lock step; writes their leaf values in tree order.
+  // Walks kBlock trees in lock step, one level of every tree per round, so
+  // that their node loads overlap; the steps are branch-free. Until the
+  // shallowest leaf of the block every tree is at a split; after that a tree
+  // that has reached its leaf keeps its index (selected by a mask) and reads
+  // entry 0 of the vector, which exists because the block has a split. Leaf
+  // values are written in tree order.
+  template <bool kRoot, bool kMasked>
+  static uint32_t step(const FlatNode* nodes, uint32_t index, const float* x) {
+    const FlatNode& n = nodes[index];
+    const auto f = static_cast<int32_t>(n.featureId);
+    const uint32_t isSplit = kMasked ? static_cast<uint32_t>(f != kLeaf) : 1u;
+    const float v = kMasked ? x[f & -static_cast<int32_t>(isSplit)] : x[f];
+    const uint32_t second = kRoot ? static_cast<uint32_t>(!(v <= n.value))
+                                  : static_cast<uint32_t>(v > n.value);
+    const uint32_t next = static_cast<uint32_t>(n.child) + second;
+    return kMasked ? index ^ ((index ^ next) & (0u - isSplit)) : next;
+  }
+
+  template <bool kMasked>
+  static void round(const FlatNode* const* base, uint32_t* index, const float* x, bool root) {
+    if (root) {
+#pragma GCC unroll 8
+      for (size_t k = 0; k < kBlock; ++k) index[k] = step<true, kMasked>(base[k], index[k], x);
+    } else {
+#pragma GCC unroll 8
+      for (size_t k = 0; k < kBlock; ++k) {
+        __builtin_prefetch(base[k] + base[k][index[k]].child, 0, 3);
+        index[k] = step<false, kMasked>(base[k], index[k], x);
+      }
+    }
+  }
+
   void walkBlock(const FlatTree* block, const float* x, float* leaves) const {
     const FlatNode* base[kBlock];
-    const FlatNode* cur[kBlock];
+    uint32_t index[kBlock];
+    uint32_t rounds = 0;
+    uint32_t unmasked = std::numeric_limits<uint32_t>::max();
     for (size_t k = 0; k < kBlock; ++k) {
-      const FlatNode* b = block[k].nodes.data();
-      base[k] = b;
+      base[k] = block[k].nodes.data();
       if (block[k].hasEqualityFeature) {
-        cur[k] = b + equalityLeaf(b, x);
-      } else if (b->featureId == kLeaf) {
-        cur[k] = b;
+        index[k] = static_cast<uint32_t>(equalityLeaf(base[k], x));
+        unmasked = 0;
       } else {
-        cur[k] = b + b->child + static_cast<size_t>(!(x[b->featureId] <= b->value));
+        index[k] = 0;
+        rounds = std::max(rounds, block[k].depth);
+        unmasked = std::min(unmasked, block[k].leafDepth);
       }
     }
-    bool more = true;
-    while (more) {
-      more = false;
-      for (size_t k = 0; k < kBlock; ++k) {
-        const FlatNode* n = cur[k];
-        if (n->featureId != kLeaf) {
-          __builtin_prefetch(base[k] + n->child, 0, 3);
-          cur[k] = base[k] + n->child + static_cast<size_t>(x[n->featureId] > n->value);
-          more = true;
-        }
-      }
-    }
-    for (size_t k = 0; k < kBlock; ++k) leaves[k] = cur[k]->value;
+    unmasked = std::min(unmasked, rounds);
+    uint32_t r = 0;
+    for (; r < unmasked; ++r) round<false>(base, index, x, r == 0);
+    for (; r < rounds; ++r) round<true>(base, index, x, r == 0);
+    for (size_t k = 0; k < kBlock; ++k) leaves[k] = base[k][index[k]].value;
   }
 
   double sumInterleaved(const float* x, size_t first, size_t end) const {
@@ -295,22 +334,22 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
   remap_ = remap && !featureMapping_.empty();
   buildEqualityMask(*forest, remap);
 
+  std::vector<Pending> pending;
   trees_.reserve(forest->trees.size());
   for (size_t i = 0; i < forest->trees.size(); ++i) {
     const WeightedTree& entry = forest->trees[i];
     if (entry.weight == 0.0) continue;
-    const std::string label = "tree " + std::to_string(i);
-    if (!entry.tree || !entry.tree->root) throw std::runtime_error(label + " has no nodes");
+    if (!entry.tree || !entry.tree->root) throw std::runtime_error(label(i) + " has no nodes");
     FlatTree flat;
-    compileTree(*entry.tree->root, entry.weight, flat, label);
+    compileTree(*entry.tree->root, entry.weight, flat, i, pending);
     trees_.push_back(std::move(flat));
   }
 
   selector_ = FlatTree{};
   const WeightedTree& selector = forest->modelSelector;
   if (selector.weight != 0.0 && selector.tree) {
-    if (!selector.tree->root) throw std::runtime_error("model selector tree has no nodes");
-    compileTree(*selector.tree->root, 1.0, selector_, "model selector tree");
+    if (!selector.tree->root) throw std::runtime_error(label(kSelector) + " has no nodes");
+    compileTree(*selector.tree->root, 1.0, selector_, kSelector, pending);
   }
 
   modelIndexMap_ = forest->modelIndexMap;
@@ -357,22 +396,22 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildEqualityMask(const Forest
 }
 
 template <typename FeatureIdT, typename NodeIndexT>
-int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::checkedPosition(
-    int32_t featureId, const std::string& label) const {
+int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::checkedPosition(int32_t featureId,
+                                                                     size_t tree) const {
   if (featureMapping_.empty()) {
     // Every position reads 0.0 in such a model; a negative one is kept as 0.
     return featureId < 0 ? 0 : featureId;
   }
   if (remap_) {
     if (featureId < 0) {
-      throw std::range_error("split in " + label + " tests feature id " +
+      throw std::range_error("split in " + label(tree) + " tests feature id " +
                              std::to_string(featureId) + " after remapping; ids must be 0 to " +
                              std::to_string(kMaxFeatureId));
     }
     return featureId;
   }
   if (featureId < 0 || static_cast<uint64_t>(featureId) >= featureMapping_.size()) {
-    throw std::range_error("split in " + label + " tests feature position " +
+    throw std::range_error("split in " + label(tree) + " tests feature position " +
                            std::to_string(featureId) + ", outside the feature vector of " +
                            std::to_string(featureMapping_.size()) + " positions");
   }
@@ -381,50 +420,62 @@ int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::checkedPosition(
 
 template <typename FeatureIdT, typename NodeIndexT>
 void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, double scale,
-                                                              FlatTree& out,
-                                                              const std::string& label) {
+                                                              FlatTree& out, size_t tree,
+                                                              std::vector<Pending>& pending) {
   out.nodes.clear();
   out.hasEqualityFeature = false;
+  out.depth = 0;
+  out.leafDepth = std::numeric_limits<uint32_t>::max();
   out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
-  std::vector<std::pair<const Node*, size_t>> pending{{&root, 0}};
+  // Depth first: go down each left spine at once, keeping right children for
+  // later, so that left subtrees are laid out before right ones.
+  pending.assign(1, Pending{&root, 0, 0});
   while (!pending.empty()) {
-    const auto [node, slot] = pending.back();
+    Pending p = pending.back();
     pending.pop_back();
-    if (node == nullptr) throw std::runtime_error(label + " has a split without both children");
-    if (node->isLeaf()) {
-      out.nodes[slot].featureId = kLeaf;
-      out.nodes[slot].value =
-          static_cast<float>(static_cast<const ConstantNode*>(node)->value * scale);
-      continue;
-    }
-    const auto& split = *static_cast<const LinearNode*>(node);
-    int32_t id = split.pivotIndex;
-    if (remap_) {
-      if (id < 0 || static_cast<uint64_t>(id) >= featureMapping_.size()) {
-        throw std::range_error("split in " + label + " tests feature position " +
-                               std::to_string(id) + ", outside the featureMapping of " +
-                               std::to_string(featureMapping_.size()) + " entries");
+    for (;;) {
+      const Node* node = p.node;
+      if (node == nullptr) {
+        throw std::runtime_error(label(tree) + " has a split without both children");
       }
-      id = static_cast<int32_t>(featureMapping_[id]);
+      out.depth = std::max(out.depth, p.depth);
+      if (node->isLeaf()) {
+        out.leafDepth = std::min(out.leafDepth, p.depth);
+        out.nodes[p.slot].featureId = kLeaf;
+        out.nodes[p.slot].value =
+            static_cast<float>(static_cast<const ConstantNode*>(node)->value * scale);
+        break;
+      }
+      const auto& split = *static_cast<const LinearNode*>(node);
+      int32_t id = split.pivotIndex;
+      if (remap_) {
+        if (id < 0 || static_cast<uint64_t>(id) >= featureMapping_.size()) {
+          throw std::range_error("split in " + label(tree) + " tests feature position " +
+                                 std::to_string(id) + ", outside the featureMapping of " +
+                                 std::to_string(featureMapping_.size()) + " entries");
+        }
+        id = static_cast<int32_t>(featureMapping_[id]);
+      }
+      if (int64_t{id} > kMaxFeatureId) {
+        throw std::range_error("feature id > max size. Use large type for FeatureIdT");
+      }
+      const int32_t position = checkedPosition(id, tree);
+      const size_t first = out.nodes.size();
+      if (first >= kNodeIndexLimit) {
+        throw std::range_error("node index > max size. Use large type for NodeIndexT");
+      }
+      FlatNode& n = out.nodes[p.slot];
+      n.featureId = static_cast<FeatureIdT>(position);
+      n.value = static_cast<float>(split.pivotValue);
+      n.child = static_cast<NodeIndexT>(first);
+      if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
+      requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
+      out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+      out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+      const uint32_t below = p.depth == UINT32_MAX ? p.depth : p.depth + 1;
+      pending.push_back({split.right.get(), first + 1, below});
+      p = Pending{split.left.get(), first, below};
     }
-    if (int64_t{id} > kMaxFeatureId) {
-      throw std::range_error("feature id > max size. Use large type for FeatureIdT");
-    }
-    const int32_t position = checkedPosition(id, label);
-    const size_t first = out.nodes.size();
-    if (first >= kNodeIndexLimit) {
-      throw std::range_error("node index > max size. Use large type for NodeIndexT");
-    }
-    FlatNode& n = out.nodes[slot];
-    n.featureId = static_cast<FeatureIdT>(position);
-    n.value = static_cast<float>(split.pivotValue);
-    n.child = static_cast<NodeIndexT>(first);
-    if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
-    requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
-    out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
-    out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
-    pending.emplace_back(split.right.get(), first + 1);
-    pending.emplace_back(split.left.get(), first);
   }
 }
 

@@ -143,20 +143,24 @@ std::unique_ptr<Node> readNodes(Source& src, NodeProblem* problem) {
   while (!pending.empty()) {
     std::unique_ptr<Node>* slot = pending.back();
     pending.pop_back();
-    const size_t at = src.offset();
-    uint8_t tag = 0;
-    const bool present = src.tag(tag);
-    if (present && tag == kLeafTag) {
-      *slot = std::make_unique<ConstantNode>(src.template read<double>());
-    } else if (present && tag == kSplitTag) {
-      const auto index = src.template read<int32_t>();
-      const auto pivot = src.template read<double>();
-      auto split = std::make_unique<LinearNode>(index, pivot);
-      LinearNode* raw = split.get();
-      *slot = std::move(split);
-      pending.push_back(&raw->right);
-      pending.push_back(&raw->left);
-    } else {
+    for (;;) {  // down the left spine; right children wait on the stack
+      const size_t at = src.offset();
+      uint8_t tag = 0;
+      const bool present = src.tag(tag);
+      if (present && tag == kLeafTag) {
+        *slot = std::make_unique<ConstantNode>(src.template read<double>());
+        break;
+      }
+      if (present && tag == kSplitTag) {
+        const auto index = src.template read<int32_t>();
+        const auto pivot = src.template read<double>();
+        auto split = std::make_unique<LinearNode>(index, pivot);
+        LinearNode* raw = split.get();
+        *slot = std::move(split);
+        pending.push_back(&raw->right);
+        slot = &raw->left;
+        continue;
+      }
       LOG(ERROR) << "ERROR: unsupported node type in deserialize_node()";
       if (problem != nullptr) *problem = NodeProblem{!present, tag, at};
       return nullptr;
@@ -170,9 +174,10 @@ std::string hexByte(uint8_t b) {
   return std::string("0x") + kDigits[b >> 4] + kDigits[b & 15];
 }
 
-// Fills `out` from one undecoded tree line; `label` names the tree in errors.
-void readTree(std::string_view line, WeightedTree& out, int32_t version,
-              const std::string& label, std::string& scratch) {
+// Fills `out` from one undecoded tree line; `label()` names the tree in errors.
+template <typename Label>
+void readTree(std::string_view line, WeightedTree& out, int32_t version, const Label& label,
+              std::string& scratch) {
   decodeInto(line, scratch);
   RecordBytes src(scratch);
   out.weight = src.read<double>();
@@ -181,7 +186,7 @@ void readTree(std::string_view line, WeightedTree& out, int32_t version,
   std::unique_ptr<Node> root = readNodes(src, &problem);
   if (!root) {
     throw std::runtime_error(
-        label + " is malformed: " +
+        label() + " is malformed: " +
         (problem.missing
              ? "its record ends at byte " + std::to_string(problem.offset) +
                    " where a node was due"
@@ -196,7 +201,7 @@ void readTree(std::string_view line, WeightedTree& out, int32_t version,
       const uint64_t needed = static_cast<uint64_t>(count) * 12;
       if (needed > src.remaining()) {
         throw std::runtime_error(
-            label + " is malformed: its featureValues count " + std::to_string(count) +
+            label() + " is malformed: its featureValues count " + std::to_string(count) +
             " needs " + std::to_string(needed) + " bytes but its record has " +
             std::to_string(src.remaining()) + " left");
       }
@@ -332,9 +337,13 @@ void Reader::readTrees(Forest& forest, int32_t version) {
   std::string scratch;
   for (uint32_t i = 0; i < count; ++i) {
     WeightedTree entry;
-    readTree(lines_.next(), entry, version,
-             "tree " + std::to_string(i) + " (of " + std::to_string(count) + ", counting from 0)",
-             scratch);
+    readTree(
+        lines_.next(), entry, version,
+        [&] {
+          return "tree " + std::to_string(i) + " (of " + std::to_string(count) +
+                 ", counting from 0)";
+        },
+        scratch);
     forest.trees.push_back(std::move(entry));
   }
 }
@@ -385,7 +394,8 @@ void Reader::readTrailer(Forest& forest, int32_t version) {
   if (readValue<int32_t>() != kModelMagic) return;
   WeightedTree selector;
   std::string scratch;
-  readTree(lines_.next(), selector, version, "model selector tree", scratch);
+  readTree(lines_.next(), selector, version, [] { return std::string("model selector tree"); },
+           scratch);
   forest.modelSelector = std::move(selector);
 
   const auto count = readValue<uint32_t>();
@@ -442,7 +452,7 @@ std::unique_ptr<Node> deserialize_node(std::istream& in) {
 
 void deserialize_tree(const std::string& line, WeightedTree& out, int32_t version) {
   std::string scratch;
-  readTree(line, out, version, "tree", scratch);
+  readTree(line, out, version, [] { return std::string("tree"); }, scratch);
 }
 
 std::unique_ptr<Forest> deserialize(std::string_view text) { return Reader(text).read(); }
