@@ -10,6 +10,7 @@
 // their ratio.
 #include <benchmark/benchmark.h>
 #include <glog/logging.h>
+#include <unistd.h>
 #include <xgboost/c_api.h>
 
 #include <cinttypes>
@@ -19,6 +20,7 @@
 #include <map>
 #include <memory>
 #include <random>
+#include <set>
 #include <sstream>
 #include <stdexcept>
 #include <string>
@@ -154,11 +156,17 @@ void compareScores() {
 // Prints the usual console output, then both times per row and their ratio.
 class RatioReporter : public benchmark::ConsoleReporter {
  public:
+  RatioReporter() : ConsoleReporter(isatty(STDOUT_FILENO) ? OO_ColorTabular : OO_Tabular) {}
+
+  // With repetitions, the mean of the repetitions is used.
   void ReportRuns(const std::vector<Run>& runs) override {
     ConsoleReporter::ReportRuns(runs);
     for (const Run& r : runs) {
-      if (r.run_type == Run::RT_Iteration && r.error_message.empty()) {
-        times_[r.benchmark_name()] = r.GetAdjustedCPUTime();
+      if (!r.error_message.empty()) continue;
+      bool mean = r.run_type == Run::RT_Aggregate && r.aggregate_name == "mean";
+      if (mean || (r.run_type == Run::RT_Iteration && !means_.count(r.run_name.str()))) {
+        times_[r.run_name.str()] = r.GetAdjustedCPUTime();
+        if (mean) means_.insert(r.run_name.str());
       }
     }
   }
@@ -174,7 +182,8 @@ class RatioReporter : public benchmark::ConsoleReporter {
   }
 
  private:
-  std::map<std::string, double> times_;
+  std::map<std::string, double> times_;  // microseconds per row
+  std::set<std::string> means_;
 };
 
 }  // namespace
