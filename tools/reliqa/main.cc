@@ -54,6 +54,7 @@ int main(int argc, char** argv) {
   app.name("reliqa");
   app.footer("Run 'reliqa COMMAND --help' for the details of a command.");
   app.require_subcommand(1);
+  app.fallthrough();  // --store and --verbose also after the command
   std::string store;
   bool verbose = false;
   app.add_option("--store", store,
