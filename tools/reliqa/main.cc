@@ -89,8 +89,9 @@ int main(int argc, char** argv) {
   std::string classifyInput;
   auto* classifyCmd = app.add_subcommand("classify", "Classify collections with the stored parameters")->footer(
       "Classify a collection with the stored parameters; prints {\"score\":S,\"isOverThreshold\":B,"
-      "\"loggingData\":{...}} on one line. With -, reads JSON Lines (one collection per line) and answers each "
-      "line as it arrives. Hour features use the process's time zone (TZ).\nExample: reliqa classify "
+      "\"loggingData\":{...}} on one line. With -, reads JSON Lines (one collection per line; blank lines are "
+      "skipped) and answers each line as it arrives; a refused line ends the run with status 2 after the answers "
+      "to the lines before it. Hour features use the process's time zone (TZ).\nExample: reliqa classify "
       "collection.json");
   classifyCmd->add_option("FILE", classifyInput, "collection JSON file, or - for JSON Lines on standard input")
       ->required();
@@ -98,7 +99,8 @@ int main(int argc, char** argv) {
   std::string featuresInput;
   auto* featuresCmd = app.add_subcommand("features", "Print the computed features of collections")->footer(
       "Print the computed features of a collection as a compact JSON object (no store needed). With -, reads "
-      "JSON Lines.\nExample: reliqa features collection.json");
+      "JSON Lines, as classify does. Feature 2 is absent without a location.\nExample: reliqa features "
+      "collection.json");
   featuresCmd->add_option("FILE", featuresInput, "collection JSON file, or - for JSON Lines on standard input")
       ->required();
 
@@ -106,7 +108,8 @@ int main(int argc, char** argv) {
   bool raw = false;
   auto* scoreCmd = app.add_subcommand("score", "Score feature rows with a model (no store)")->footer(
       "Score feature rows with a model, no store: each input line is a JSON object of feature id to number "
-      "({\"3\":0.25,\"17\":-1}); each output line is the score. Absent features read as 0.\nExample: reliqa "
+      "({\"3\":0.25,\"17\":-1}); each output line is the score. Absent features read as 0; blank lines are "
+      "skipped; a refused line ends the run with status 2.\nExample: reliqa "
       "score --model model.txt rows.jsonl");
   scoreCmd->add_option("--model", scoreModel, "model text")->required();
   scoreCmd->add_option("ROWS", scoreRows, "JSON Lines file of feature rows (default -, standard input)");
