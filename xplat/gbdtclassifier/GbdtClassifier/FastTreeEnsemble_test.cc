@@ -7,6 +7,7 @@
 #include <limits>
 #include <random>
 #include <set>
+#include <tuple>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
 
@@ -94,27 +95,21 @@ double referenceRaw(const Forest& f, const std::vector<float>& x) {
 
 TEST(Compile, LayoutAndLeafValues) {
   Forest f = mapped(4);
-  // root (f1 <= 0.1): A | B (f3 <= 2): C | D
+  // root (f1 <= 0.1): A | B (f3 <= 2): C | D, compiled as root, A, B, C, D
   f.trees.push_back(weighted(split(1, 0.1, leaf(1.0), split(3, 2.0, leaf(2.0), leaf(3.0))), 0.1));
   f.trees.push_back(weighted(leaf(2.0), 0.1));
   auto e = compiled(f);
-  const auto& nodes = e->getTrees()[0].nodes;
-  ASSERT_EQ(nodes.size(), 5u);
-  EXPECT_EQ(nodes[0].featureId, 1);
-  EXPECT_EQ(nodes[0].child, 1u);
-  EXPECT_EQ(nodes[0].value, 0.1f);
-  EXPECT_EQ(nodes[2].featureId, 3);
-  EXPECT_EQ(nodes[2].child, 3u);
-  for (int i : {1, 3, 4}) {
-    EXPECT_EQ(nodes[i].featureId, -1);
-    EXPECT_EQ(nodes[i].child, 0u);
-  }
-  EXPECT_EQ(nodes[3].value, static_cast<float>(2.0 * 0.1));
+  std::vector<std::tuple<int, unsigned, float>> nodes;
+  for (const auto& n : e->getTrees()[0].nodes) nodes.emplace_back(n.featureId, n.child, n.value);
+  EXPECT_THAT(nodes, ElementsAre(std::make_tuple(1, 1u, 0.1f), std::make_tuple(-1, 0u, 0.1f),
+                                 std::make_tuple(3, 3u, 2.0f), std::make_tuple(-1, 0u, 0.2f),
+                                 std::make_tuple(-1, 0u, static_cast<float>(3.0 * 0.1))));
   const auto& single = e->getTrees()[1].nodes;
   ASSERT_EQ(single.size(), 1u);
   EXPECT_EQ(single[0].featureId, -1);
   EXPECT_EQ(single[0].value, 0.2f);
   EXPECT_EQ(e->requiredFeatures(), 4u);
+  EXPECT_THROW(e->unnormalizedScore({0, 0, 0}), std::invalid_argument);  // too short
 }
 
 TEST(Compile, ExactArithmeticOfLeafSumAndLogistic) {
@@ -228,16 +223,15 @@ TEST(InitResults, NullDecreasingMapAndRemapWithoutMapping) {
 }
 
 TEST(InitResults, RemapTranslatesPositions) {
-  Forest f = mapped(0);
+  Forest f;
   f.featureMapping = {5, 2};
-  f.equalityFeatures = {0};  // remapped to feature id 5
+  f.equalityFeatures = {0};  // becomes feature id 5
   f.trees.push_back(weighted(split(0, 1.0, leaf(1), leaf(2)), 1));
   Forest32 e;
   EXPECT_TRUE(e.init(&f, true));
   EXPECT_EQ(e.getTrees()[0].nodes[0].featureId, 5);
-  EXPECT_TRUE(e.getTrees()[0].hasEqualityFeature);
-  EXPECT_EQ(e.unnormalizedScore({0, 0, 0, 0, 0, 1.0f}), 1);
-  EXPECT_EQ(e.unnormalizedScore({0, 0, 0, 0, 0, 0.5f}), 2);
+  EXPECT_EQ(e.unnormalizedScore({0, 0, 0, 0, 0, 1.0f}), 1);  // equality split
+  EXPECT_EQ(e.unnormalizedScore({0, 0, 0, 0, 0, 1.5f}), 2);
 }
 
 TEST(Limits, FeatureIdLimitsThenPositionChecks) {
@@ -286,14 +280,6 @@ TEST(Limits, EqualityMaskIsBoundedByTheVector) {
   EXPECT_THAT([&] { e.init(&f, false); },
               ::testing::ThrowsMessage<std::range_error>(
                   HasSubstr("equality feature 8 is outside the equality mask of 8 features")));
-}
-
-TEST(Scoring, ShortVectorsAreRefused) {
-  Forest f = mapped(3);
-  f.trees.push_back(weighted(split(2, 0, leaf(0), leaf(1)), 1));
-  auto e = compiled(f);
-  EXPECT_THROW(e->unnormalizedScore({0, 0}), std::invalid_argument);
-  EXPECT_EQ(e->unnormalizedScore({0, 0, 1}), 1);
 }
 
 // The interleaved walk must give exactly the one-by-one sum and the rules

@@ -190,8 +190,8 @@ TEST(Concurrency, PredictFromSeveralThreads) {
   FLAGS_minloglevel = google::GLOG_INFO;
 }
 
-// Reading, copying, linking, compiling, scoring and destroying a model whose
-// tree is a million levels deep, on a 256 KiB stack.
+// Writing, reading, copying, linking, compiling, scoring and destroying a
+// model whose tree is a million levels deep, on a 256 KiB stack.
 TEST(DeepModel, MillionLevelChainEndToEnd) {
   FLAGS_minloglevel = google::GLOG_WARNING;
   constexpr size_t kDepth = 1000000;
@@ -201,9 +201,9 @@ TEST(DeepModel, MillionLevelChainEndToEnd) {
   f.trees.push_back(weighted(testing::chain(kDepth), 1));
   f.modelSelector = weighted(testing::chain(1000), 1);
   f.modelIndexMap = {1};
-  const std::string text = writeModel(f, 3);
-  f = Forest();
   testing::runOnSmallStack([&] {
+    const std::string text = writeModel(f, 3);
+    f = Forest();
     ::testing::internal::CaptureStdout();
     auto model = std::make_unique<BoostingModel>(text);
     ::testing::internal::GetCapturedStdout();

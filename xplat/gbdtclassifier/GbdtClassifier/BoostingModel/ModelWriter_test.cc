@@ -105,15 +105,5 @@ TEST(ModelWriter, RefusesWhatItCannotWriteFaithfully) {
   refused(averaged, 3, "need format version 4");
 }
 
-TEST(ModelWriter, DeepChainWritesAndReadsOnSmallStack) {
-  testing::runOnSmallStack([] {
-    Forest f;
-    f.trees.push_back(weighted(testing::chain(200000), 1));
-    auto back = readBack(writeModel(f, 2));
-    std::string why;
-    EXPECT_TRUE(testing::sameForest(f, *back, &why)) << why;
-  });
-}
-
 }  // namespace
 }  // namespace thornvale
