@@ -87,6 +87,16 @@ TEST(Inspect, SummaryCountsTreesAndNamesTheForestWidth) {
   EXPECT_EQ(h.version, 4);
 }
 
+TEST(Inspect, SummaryListsSubModelRangesOverKeptTrees) {
+  Forest f = twoInputForest();  // trees 0 and 1 kept, tree 2 dropped
+  f.modelSelector = thornvale::WeightedTree(stump(0, 1.0, 0.0, 1.0), 1.0);
+  f.modelIndexMap = {1, 5};  // 5 lies past the kept trees and is clamped
+  std::string s = describeModel("m.txt", thornvale::writeModel(f, 4), f, true);
+  EXPECT_THAT(s, HasSubstr("a tree of depth 1 with 2 leaves chooses a sub-model"));
+  EXPECT_THAT(s, HasSubstr("sub-models       0: trees 0 to 0\n                 1: trees 1 to 1\n"
+                           "                 2: no trees (base score only)\n"));
+}
+
 TEST(Inspect, PrintsTreesAndRulesWithInputNames) {
   Forest f = twoInputForest();
   EXPECT_EQ(printOneTree("m", f, 0),
