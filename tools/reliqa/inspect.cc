@@ -163,6 +163,21 @@ std::string describeModel(const std::string& name, const std::string& modelText,
 }
 
 namespace {
+
+// Links the trees for the printers. Input keys that are bare numbers (the
+// feature ids of converted models) read as "feature 3", so that a rule never
+// looks like a comparison of two numbers.
+void linkForPrinting(Forest& forest) {
+  std::vector<std::string> names = forest.inputKeys;
+  for (std::string& n : names) {
+    bool number = !n.empty() && n.find_first_not_of("-0123456789") == std::string::npos;
+    if (number) n = "feature " + n;
+  }
+  std::swap(forest.inputKeys, names);
+  thornvale::linkForest(forest);
+  std::swap(forest.inputKeys, names);
+}
+
 void checkIndex(const std::string& name, const Forest& forest, int64_t index) {
   if (index < 0 || static_cast<size_t>(index) >= forest.trees.size()) {
     throw ToolError(name, 0, "there is no tree " + std::to_string(index) + "; the model has " +
@@ -173,7 +188,7 @@ void checkIndex(const std::string& name, const Forest& forest, int64_t index) {
 
 std::string printOneTree(const std::string& name, Forest& forest, int64_t index) {
   checkIndex(name, forest, index);
-  thornvale::linkForest(forest);
+  linkForPrinting(forest);
   const auto& wt = forest.trees[index];
   std::ostringstream out;
   out << "tree " << index << ", weight " << thornvale::doubleToText(wt.weight) << '\n';
@@ -183,7 +198,7 @@ std::string printOneTree(const std::string& name, Forest& forest, int64_t index)
 
 std::string printAllRules(const std::string& name, Forest& forest, int64_t only) {
   if (only >= 0) checkIndex(name, forest, only);
-  thornvale::linkForest(forest);
+  linkForPrinting(forest);
   std::ostringstream out;
   for (size_t i = 0; i < forest.trees.size(); ++i) {
     if (only >= 0 && i != static_cast<size_t>(only)) continue;

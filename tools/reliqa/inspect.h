@@ -5,7 +5,9 @@
 // mapping, equality features, average values, the selector with its sub-model
 // ranges, and which compiled forest (16- or 32-bit) the engine builds.
 // printOneTree() and printAllRules() print trees with the nodes' own printers,
-// after linking them so that features are named by their input keys.
+// after linking them so that features are named by their input keys (a key
+// that is a bare number, such as a converted model's feature id, is shown as
+// "feature 3").
 // Trees of any depth are walked without recursion. Pure; any thread.
 #pragma once
 

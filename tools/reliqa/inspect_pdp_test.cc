@@ -103,6 +103,8 @@ TEST(Inspect, PrintsTreesAndRulesWithInputNames) {
             "tree 0, weight 1\nIf size <= 0.5 then\n\tFinal value = 1\nIf size > 0.5 then\n\tFinal value = 2\n");
   EXPECT_THAT(printAllRules("m", f, 1), "tree 1, weight 0.5\n20\t3 < age; \n10\tage <= 3; \n");
   EXPECT_THROW(printOneTree("m", f, 3), ToolError);
+  f.inputKeys = {"10", "20"};  // ids as names read as features, not numbers
+  EXPECT_THAT(printAllRules("m", f, 1), "tree 1, weight 0.5\n20\t3 < feature 10; \n10\tfeature 10 <= 3; \n");
 }
 
 }  // namespace
