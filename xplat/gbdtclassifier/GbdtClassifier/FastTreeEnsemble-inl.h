@@ -96,6 +96,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     NodeIndexT child;      // split: index of the first child; leaf: 0
     float value;           // split: threshold; leaf: value * weight
   };
+  static_assert(sizeof(FlatNode) <= 12, "compiled nodes take 12 bytes or less");
   struct FlatTree {
     std::vector<FlatNode> nodes;  // root at index 0
     bool hasEqualityFeature = false;
@@ -367,7 +368,7 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildEqualityMask(const Forest
                                                                     bool remap) {
   equalityMask_.clear();
   if (featureMapping_.empty()) return;  // no feature is an equality feature
-  const uint64_t specified =
+  const uint64_t maskSize =
       uint64_t{*std::max_element(featureMapping_.begin(), featureMapping_.end())} + 1;
   // Only positions a split can address are ever looked up.
   const uint64_t addressable = remap ? uint64_t(kMaxFeatureId) + 1 : featureMapping_.size();
@@ -383,9 +384,9 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildEqualityMask(const Forest
       }
       position = featureMapping_[e];
     }
-    if (position >= specified) {
+    if (position >= maskSize) {
       throw std::range_error("equality feature " + std::to_string(position) +
-                             " is outside the equality mask of " + std::to_string(specified) +
+                             " is outside the equality mask of " + std::to_string(maskSize) +
                              " features");
     }
     if (position < addressable) set.push_back(position);

@@ -276,7 +276,7 @@ TEST(Limits, EqualityMaskIsBoundedByTheVector) {
   EXPECT_TRUE(e.getTrees()[0].hasEqualityFeature);
 
   f.featureMapping = {7, 1, 3};
-  f.equalityFeatures = {8};  // at the specified size (largest entry + 1)
+  f.equalityFeatures = {8};  // at the mask size (largest entry + 1)
   EXPECT_THAT([&] { e.init(&f, false); },
               ::testing::ThrowsMessage<std::range_error>(
                   HasSubstr("equality feature 8 is outside the equality mask of 8 features")));
