@@ -270,6 +270,16 @@ class Store(Tool):
         self.assertTrue(line.endswith('","threshold":"0.5"}}\n'))
 
 
+class Features(Tool):
+    def test_hours_follow_the_tz_variable(self):
+        c = self.path("c.json", collection(1))  # created 22:13 UTC
+        utc = json.loads(self.ok("features", c))
+        self.env["TZ"] = "JST-9"  # a POSIX rule: needs no zone files
+        tokyo = json.loads(self.ok("features", c))
+        self.assertEqual((utc["44"], tokyo["44"]), (22, 7))
+        self.assertEqual(len(utc), 73)  # no location, so no feature 2
+
+
 class Inspection(Tool):
     def test_inspect_and_pdp_on_the_example_model(self):
         model = os.path.join(ROOT, "examples", "model.txt")
