@@ -74,8 +74,8 @@ def rows_for(rng, f, splits):
     return np.vstack([base, np.array(special, dtype=np.float32)])
 
 
-def check_model(reliqa, work, rng, spec):
-    name, f, depth, trees, base_score, objective, method, naming = spec
+def check_model(reliqa, work, rng, config):
+    name, f, depth, trees, base_score, objective, method, naming = config
     x, y = make_data(rng, 3000, f)
     if naming == "sparse":
         ids = [int(i) for i in sorted(rng.choice(5000, f, replace=False) - 1000)]
@@ -143,8 +143,8 @@ def main():
     os.makedirs(work, exist_ok=True)
     rng = np.random.RandomState(SEED)
     problems = []
-    for spec in MODELS:
-        problems += check_model(reliqa, work, rng, spec)
+    for config in MODELS:
+        problems += check_model(reliqa, work, rng, config)
     for p in problems:
         print("crosscheck: FAILED: " + p)
     print(f"crosscheck: {len(MODELS) - len({p.split(':')[0] for p in problems})} passed, "
