@@ -5,8 +5,9 @@
 // "mHybridData" and copy the share, so the native store lives on after the
 // Java store is closed for as long as anybody still uses it.
 //
-// The peer itself is immutable; the store it shares has no lock of its own
-// (its users serialise their calls).
+// The peer itself is immutable. The store it shares serialises its own calls,
+// so classifiers that copied the share may use it from different threads at
+// once.
 #pragma once
 
 #include <memory>
