@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <cstring>
 #include <map>
+#include <memory>
 #include <string>
 
 #include "host/jni/Environment.h"
@@ -135,6 +136,21 @@ void initializeWithFailingRegistration(JNIEnv* env, jclass) {
   }
 }
 
+// A peer that holds nothing, for the attachment check below.
+class EmptyPeer : public jni::HybridClass<EmptyPeer> {};
+
+// static native void attachTwice()
+// Attaches a second peer to a holder that already has one; the process must
+// abort rather than lose track of the first peer.
+void attachTwice(JNIEnv* env, jclass) {
+  entryPoint<void>(env, [] {
+    jni::LocalRef<jobject> hybridData = jni::detail::HybridData::create();
+    jni::LocalRef<jobject> destructor = jni::detail::HybridData::getDestructor(hybridData.get());
+    attachPeer(destructor.get(), std::make_unique<EmptyPeer>());
+    attachPeer(destructor.get(), std::make_unique<EmptyPeer>());
+  });
+}
+
 void registerNatives() {
   static const JNINativeMethod methods[] = {
       {const_cast<char*>("describeInput"),
@@ -155,11 +171,13 @@ void registerNatives() {
        reinterpret_cast<void*>(&classifyDirectly)},
       {const_cast<char*>("initializeWithFailingRegistration"), const_cast<char*>("()V"),
        reinterpret_cast<void*>(&initializeWithFailingRegistration)},
+      {const_cast<char*>("attachTwice"), const_cast<char*>("()V"),
+       reinterpret_cast<void*>(&attachTwice)},
   };
   JNIEnv* env = jni::Environment::current();
   jni::LocalRef<jclass> cls =
       jni::findClassLocal("com/kestrova/sharefold/reliqaclassifier/models/NativeReference");
-  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 4) != JNI_OK);
+  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 5) != JNI_OK);
 }
 
 }  // namespace

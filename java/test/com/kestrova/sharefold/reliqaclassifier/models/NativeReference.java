@@ -32,4 +32,7 @@ final class NativeReference {
    * failure (the VM's NoSuchMethodError) is thrown from here.
    */
   static native void initializeWithFailingRegistration();
+
+  /** Attaches a second peer to a holder that has one: the process aborts. */
+  static native void attachTwice();
 }

@@ -4,16 +4,21 @@ import static com.kestrova.sharefold.reliqaclassifier.models.Fixtures.collection
 import static com.kestrova.sharefold.reliqaclassifier.models.Fixtures.wrapperOf;
 import static org.junit.jupiter.api.Assertions.assertArrayEquals;
 import static org.junit.jupiter.api.Assertions.assertEquals;
+import static org.junit.jupiter.api.Assertions.assertNotEquals;
 import static org.junit.jupiter.api.Assertions.assertThrows;
+import static org.junit.jupiter.api.Assertions.assertTrue;
 
 import com.kestrova.keystash.PersistentKeyValueStore;
 import java.lang.reflect.Method;
 import java.lang.reflect.Modifier;
+import java.nio.charset.StandardCharsets;
 import java.nio.file.Path;
 import java.util.Arrays;
+import java.util.List;
 import java.util.Map;
 import java.util.Set;
 import java.util.TreeSet;
+import java.util.concurrent.TimeUnit;
 import java.util.stream.Collectors;
 import org.junit.jupiter.api.Test;
 import org.junit.jupiter.api.function.Executable;
@@ -115,6 +120,29 @@ class PeerTest {
     }
     assertEquals(0, nativePointer(classifierDestructor));
     assertEquals(0, nativePointer(resultDestructor));
+  }
+
+  /** Entry point of the child process of the next test. */
+  public static void main(String[] args) {
+    NativeReference.attachTwice();
+  }
+
+  @Test
+  void attachingASecondPeerToAHolderAbortsTheProcess() throws Exception {
+    Process child = new ProcessBuilder(List.of(
+            Path.of(System.getProperty("java.home"), "bin", "java").toString(),
+            "-Xcheck:jni",
+            "-Djava.library.path=" + System.getProperty("java.library.path"),
+            "-cp", System.getProperty("java.class.path"),
+            PeerTest.class.getName()))
+        .redirectErrorStream(true)
+        .start();
+    String output = new String(child.getInputStream().readAllBytes(), StandardCharsets.UTF_8);
+    assertTrue(child.waitFor(120, TimeUnit.SECONDS), "child process hung");
+    System.out.print(output);  // JNI warnings of the child reach the test log
+    assertNotEquals(0, child.exitValue(), output);
+    assertTrue(output.matches("(?s).*Fatal error \\([^)]*:\\d+\\): "
+        + "Attempt to set C\\+\\+ native pointer twice.*"), output);
   }
 
   @Test
