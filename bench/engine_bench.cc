@@ -4,7 +4,9 @@
 // the "r" models have the same depths with ragged shapes (below the second
 // level a node is a leaf with probability 0.2), as trainers produce them.
 //
-//   Score/<model>/<bits>      unnormalizedScore: 8 trees walked at once
+//   Score/<model>/<bits>      unnormalizedScore with the CPU's best kernel
+//   Score<kernel>/<model>/<bits>  the same with the AVX2 gather kernel or the
+//                             portable walk (8 trees in lock step, scalar)
 //   OneByOne/<model>/<bits>   the same sum, one tree after another
 //   Predict/<model>/<bits>    BoostingModel::predict on a FeatureMap, INFO off
 //   Load/<model>              read + compile (BoostingModel construction;
@@ -55,6 +57,7 @@ class QuietStdout {
 struct Fixture {
   std::string text;
   std::unique_ptr<BoostingModel> model;
+  Forest forest;
   std::vector<std::vector<float>> vectors;
   std::vector<FeatureMap> maps;
 };
@@ -66,6 +69,7 @@ Fixture& fixture(const Shape& shape, bool sixteenBit) {
   Forest forest =
       testing::randomForest(42, shape.trees, shape.depth, kInputs, sixteenBit, shape.earlyLeaf);
   f.text = writeModel(forest, 4);
+  f.forest = std::move(forest);
   {
     QuietStdout quiet;
     f.model = std::make_unique<BoostingModel>(f.text);
@@ -90,6 +94,21 @@ void score(benchmark::State& state, const Shape* shape, bool sixteenBit, bool in
     benchmark::DoNotOptimize(interleaved ? e.unnormalizedScore(x) : e.unnormalizedScoreOneByOne(x));
   }
   state.counters["trees"] = static_cast<double>(e.numTrees());
+}
+
+// The model's forest compiled again, scored with the given kernel.
+template <typename Ensemble>
+void scoreWith(benchmark::State& state, const Shape* shape, WalkKernel kernel) {
+  Fixture& f = fixture(*shape, sizeof(typename Ensemble::FlatNode{}.featureId) == 2);
+  Ensemble e;
+  e.init(&f.forest, false);
+  if (!e.useWalkKernel(kernel)) {
+    state.SkipWithError("this CPU cannot run the kernel");
+    return;
+  }
+  size_t i = 0;
+  for (auto _ : state) benchmark::DoNotOptimize(e.unnormalizedScore(f.vectors[i++ % kVectors]));
+  state.counters["gather_MB"] = static_cast<double>(e.gatherBytes()) / 1e6;
 }
 
 void predict(benchmark::State& state, const Shape* shape, bool sixteenBit) {
@@ -124,6 +143,14 @@ int main(int argc, char** argv) {
     for (bool sixteen : {true, false}) {
       const std::string suffix = std::string(s.name) + (sixteen ? "/16bit" : "/32bit");
       benchmark::RegisterBenchmark(("Score/" + suffix).c_str(), score, &s, sixteen, true);
+      for (auto [name, kernel] : {std::pair{"ScoreAvx2/", WalkKernel::kAvx2},
+                                  std::pair{"ScoreScalar/", WalkKernel::kScalar},
+                                  std::pair{"ScorePortable/", WalkKernel::kPortable}}) {
+        benchmark::RegisterBenchmark((name + suffix).c_str(),
+                                     sixteen ? scoreWith<FastTreeEnsembleOOP<short, unsigned>>
+                                             : scoreWith<FastTreeEnsembleOOP<int, unsigned>>,
+                                     &s, kernel);
+      }
       benchmark::RegisterBenchmark(("OneByOne/" + suffix).c_str(), score, &s, sixteen, false);
       benchmark::RegisterBenchmark(("Predict/" + suffix).c_str(), predict, &s, sixteen);
     }

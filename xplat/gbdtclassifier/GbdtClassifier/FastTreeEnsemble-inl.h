@@ -15,8 +15,15 @@
 // x > t, so NaN goes second at the root and first deeper down. A tree that
 // tests an equality feature is walked with x != t (second child) at equality
 // splits and x > t at the others, the root included. unnormalizedScore()
-// walks 8 trees at once so that their memory loads overlap, yet adds the
+// walks many trees at once so that their memory loads overlap, yet adds the
 // leaves in tree order, so it is bit-identical to unnormalizedScoreOneByOne().
+// On x86-64 CPUs with AVX-512F or AVX2 it walks 32 plain trees per call of a
+// gather kernel (FastTreeEnsembleSimd.h) over a second copy of their nodes,
+// made by init() (8 bytes per node, plus 16 bytes per tree that is a single
+// leaf, and 8 bytes per tree); elsewhere it walks 8 trees in lock step in scalar
+// code. Trees with equality features, deeper than kMaxGatherDepth or with
+// more than kWalkMaxDistance nodes, and forests reading more than
+// kMaxGatherFeatures positions, take the scalar walks.
 //
 // Errors: init() returns false for a null forest and (after an ERROR log) for
 // a decreasing modelIndexMap; it throws std::range_error when a split's
@@ -53,6 +60,7 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsembleSimd.h"
 
 namespace thornvale {
 
@@ -111,6 +119,12 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   // A first-child index at or above this cannot be stored.
   static constexpr uint64_t kNodeIndexLimit = uint64_t{std::numeric_limits<NodeIndexT>::max()} - 1;
   static constexpr size_t kBlock = 8;
+  // Trees deeper than this are left to the scalar walks: a group runs as
+  // many steps as its deepest tree.
+  static constexpr uint32_t kMaxGatherDepth = 64;
+  // The gather kernels read a copy of the features on the stack.
+  static constexpr size_t kMaxGatherFeatures = 1023;
+  static_assert(kMaxGatherFeatures <= kWalkMaxFeature, "the NaN slot must fit a WalkNode");
 
   bool init(const Forest* forest, bool remap) override;
 
@@ -118,6 +132,9 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     checkLength(features);
     const float* x = features.data();
     const auto [first, end] = selectModel(x);
+    if (kernel_ != WalkKernel::kPortable && !gatherRoot_.empty()) {
+      return sumGathered(x, first, end);
+    }
     return sumInterleaved(x, first, end);
   }
   double score(const std::vector<float>& features) const override {
@@ -137,6 +154,22 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   size_t numTrees() const override { return trees_.size(); }
   size_t requiredFeatures() const override { return requiredFeatures_; }
   int featureIdBits() const override { return static_cast<int>(8 * sizeof(FeatureIdT)); }
+
+  // The kernel that unnormalizedScore() uses: the best one of this CPU until
+  // useWalkKernel() picks another. Changing it while other threads score is
+  // a data race.
+  WalkKernel walkKernel() const { return kernel_; }
+  // Returns false, and changes nothing, when the CPU cannot run `kernel`.
+  bool useWalkKernel(WalkKernel kernel) {
+    if (!walkKernelSupported(kernel)) return false;
+    kernel_ = kernel;
+    return true;
+  }
+  // Bytes held by the copy of the nodes that the gather kernels walk.
+  size_t gatherBytes() const {
+    return gatherNodes_.size() * sizeof(WalkNode) +
+           (gatherRoot_.size() + gatherDepth_.size()) * sizeof(uint32_t);
+  }
 
   // The range [first, end) of trees that the selector chooses for `features`.
   std::pair<size_t, size_t> selectModel(const std::vector<float>& features) const {
@@ -312,6 +345,39 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     return sum;
   }
 
+  static bool gatherable(const FlatTree& tree);
+  void buildGatherNodes();
+
+  // Groups of kWalkGroup consecutive trees go to the gather kernel; lanes
+  // past `end` and lanes of trees that the kernel does not take walk the
+  // constant tree at index 0, and the latter are walked here instead.
+  double sumGathered(const float* features, size_t first, size_t end) const {
+    // The features, the NaN slot, and NaN up to a multiple of 32 entries.
+    alignas(64) float x[(kMaxGatherFeatures + 32) / 32 * 32];
+    const size_t used = requiredFeatures_;
+    if (used != 0) std::copy(features, features + used, x);
+    const size_t slots = used + 1;
+    std::fill(x + used, x + (slots + 31) / 32 * 32, std::numeric_limits<float>::quiet_NaN());
+    double sum = baseScore_;
+    uint32_t roots[kWalkGroup];
+    float leaves[kWalkGroup];
+    for (size_t i = first; i < end; i += kWalkGroup) {
+      const size_t n = std::min(kWalkGroup, end - i);
+      uint32_t rounds = 1;
+      for (size_t k = 0; k < n; ++k) {
+        roots[k] = gatherRoot_[i + k];
+        rounds = std::max(rounds, gatherDepth_[i + k]);
+      }
+      std::fill(roots + n, roots + kWalkGroup, 0u);
+      walkGroup(kernel_, gatherNodes_.data(), roots, rounds, x, slots, leaves);
+      for (size_t k = 0; k < n; ++k) {
+        const float v = gatherDepth_[i + k] != 0 ? leaves[k] : leafValue(trees_[i + k], features);
+        sum += static_cast<double>(v);
+      }
+    }
+    return sum;
+  }
+
   std::vector<FlatTree> trees_;
   double baseScore_ = 0.0;
   FlatTree selector_;
@@ -320,12 +386,24 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   std::vector<uint32_t> featureMapping_;
   bool remap_ = false;
   size_t requiredFeatures_ = 0;
+  // The plain trees again, for the gather kernels (see FastTreeEnsembleSimd.h):
+  // the constant tree (value 0) at index 0, then one tree after another.
+  // gatherRoot_[i] is the index of tree i's root (0 for a tree that the
+  // kernels do not take), gatherDepth_[i] its number of steps (0 for such a
+  // tree). All empty when the kernels cannot be used for this forest.
+  std::vector<WalkNode> gatherNodes_;
+  std::vector<uint32_t> gatherRoot_;
+  std::vector<uint32_t> gatherDepth_;
+  WalkKernel kernel_ = bestWalkKernel();
 };
 
 template <typename FeatureIdT, typename NodeIndexT>
 bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, bool remap) {
   if (forest == nullptr) return false;
   trees_.clear();
+  gatherNodes_.clear();
+  gatherRoot_.clear();
+  gatherDepth_.clear();
   baseScore_ = forest->baseScore;
   featureMapping_ = forest->featureMapping;
   requiredFeatures_ = 0;
@@ -352,6 +430,7 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
     if (!selector.tree->root) throw std::runtime_error(label(kSelector) + " has no nodes");
     compileTree(*selector.tree->root, 1.0, selector_, kSelector, pending);
   }
+  buildGatherNodes();
 
   modelIndexMap_ = forest->modelIndexMap;
   for (size_t i = 1; i < modelIndexMap_.size(); ++i) {
@@ -361,6 +440,62 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
     }
   }
   return true;
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
+bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::gatherable(const FlatTree& tree) {
+  return !tree.hasEqualityFeature && tree.depth <= kMaxGatherDepth &&
+         tree.nodes.size() <= kWalkMaxDistance;
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
+void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildGatherNodes() {
+  if (trees_.empty() || requiredFeatures_ > kMaxGatherFeatures) return;
+  // Node indices must stay below 2^31: the gathers take signed indices.
+  uint64_t count = 3;
+  for (const FlatTree& t : trees_) {
+    if (gatherable(t)) count += t.nodes.size() + 2;
+  }
+  if (count > uint64_t{std::numeric_limits<int32_t>::max()}) return;
+
+  const auto nanSlot = static_cast<uint32_t>(requiredFeatures_);
+  std::vector<WalkNode> nodes;
+  nodes.reserve(count);
+  // A root on the NaN slot goes to its second child; both children are the leaf.
+  auto constantTree = [&](float value) {
+    nodes.push_back(walkNode(nanSlot, 1, 0.0f));
+    nodes.push_back(walkNode(nanSlot, 0, value));
+    nodes.push_back(walkNode(nanSlot, 0, value));
+  };
+  constantTree(0.0f);
+  gatherRoot_.assign(trees_.size(), 0);
+  gatherDepth_.assign(trees_.size(), 0);
+  bool any = false;
+  for (size_t i = 0; i < trees_.size(); ++i) {
+    const FlatTree& t = trees_[i];
+    if (!gatherable(t)) continue;
+    any = true;
+    gatherRoot_[i] = static_cast<uint32_t>(nodes.size());
+    if (t.nodes[0].featureId == kLeaf) {
+      constantTree(t.nodes[0].value);
+      gatherDepth_[i] = 1;
+      continue;
+    }
+    gatherDepth_[i] = t.depth;
+    for (size_t j = 0; j < t.nodes.size(); ++j) {
+      const FlatNode& n = t.nodes[j];
+      nodes.push_back(n.featureId == kLeaf
+                          ? walkNode(nanSlot, 0, n.value)
+                          : walkNode(static_cast<uint32_t>(n.featureId),
+                                     static_cast<uint32_t>(n.child - j), n.value));
+    }
+  }
+  if (!any) {
+    gatherRoot_.clear();
+    gatherDepth_.clear();
+    return;
+  }
+  gatherNodes_ = std::move(nodes);
 }
 
 template <typename FeatureIdT, typename NodeIndexT>

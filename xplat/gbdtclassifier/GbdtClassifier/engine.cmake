@@ -4,7 +4,8 @@ add_library(gbdt STATIC
   BoostingModel/tree.cc
   BoostingModel/serialize.cc
   BoostingModel/ModelWriter.cc
-  BoostingModel/BoostingModel.cc)
+  BoostingModel/BoostingModel.cc
+  FastTreeEnsembleSimd.cc)
 target_include_directories(gbdt PUBLIC ${PROJECT_SOURCE_DIR})
 target_link_libraries(gbdt PUBLIC glog::glog)
 

@@ -1,0 +1,203 @@
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsembleSimd.h"
+
+#include <glog/logging.h>
+
+#if defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
+#define RELIQA_WALK_X86 1
+#include <immintrin.h>
+#endif
+
+namespace thornvale {
+
+#ifdef RELIQA_WALK_X86
+namespace {
+
+// Several independent vectors per group keep enough gathers in flight to
+// hide their latency; each step of a lane depends on the one before.
+constexpr int kAvx512Vectors = kWalkGroup / 16;
+constexpr int kAvx2Vectors = kWalkGroup / 8;
+
+// The feature values that a step compares: gathered from memory, or, for
+// up to 32 * kPairs slots, picked from registers that hold them all.
+template <int kPairs>
+struct FeaturesAvx512 {
+  __m512 table[2 * kPairs > 0 ? 2 * kPairs : 1];
+  const float* x;
+
+  __attribute__((target("avx512f"))) explicit FeaturesAvx512(const float* features) : x(features) {
+    for (int i = 0; i < 2 * kPairs; ++i) table[i] = _mm512_loadu_ps(features + 16 * i);
+  }
+  __attribute__((target("avx512f"))) __m512 operator()(__m512i feature) const {
+    if constexpr (kPairs == 0) {
+      // The masked form with a zero source: the plain one leaves its source
+      // undefined, which some compilers warn about.
+      return _mm512_mask_i32gather_ps(_mm512_setzero_ps(), 0xFFFF, feature, x, 4);
+    } else {
+      __m512 v = _mm512_permutex2var_ps(table[0], feature, table[1]);
+      for (int p = 1; p < kPairs; ++p) {
+        const __mmask16 above = _mm512_cmpge_epu32_mask(feature, _mm512_set1_epi32(32 * p));
+        v = _mm512_mask_mov_ps(v, above, _mm512_permutex2var_ps(table[2 * p], feature, table[2 * p + 1]));
+      }
+      return v;
+    }
+  }
+};
+
+// One step of 16 lanes: gather the 16 nodes (two 64-bit gathers), split them
+// into links and thresholds, fetch the features, compare, move on.
+template <bool kRoot, typename Features>
+__attribute__((target("avx512f"))) inline __m512i stepAvx512(__m512i at, const WalkNode* nodes,
+                                                             const Features& x) {
+  const __m512i even = _mm512_setr_epi32(0, 2, 4, 6, 8, 10, 12, 14, 16, 18, 20, 22, 24, 26, 28, 30);
+  const __m512i odd = _mm512_setr_epi32(1, 3, 5, 7, 9, 11, 13, 15, 17, 19, 21, 23, 25, 27, 29, 31);
+  const __m512i lo = _mm512_mask_i32gather_epi64(_mm512_setzero_si512(), 0xFF,
+                                                 _mm512_castsi512_si256(at), nodes, 8);
+  const __m512i hi = _mm512_mask_i32gather_epi64(_mm512_setzero_si512(), 0xFF,
+                                                 _mm512_extracti64x4_epi64(at, 1), nodes, 8);
+  const __m512i link = _mm512_permutex2var_epi32(lo, even, hi);
+  const __m512 threshold = _mm512_castsi512_ps(_mm512_permutex2var_epi32(lo, odd, hi));
+  const __m512 value = x(_mm512_and_si512(link, _mm512_set1_epi32(kWalkMaxFeature)));
+  // The root sends NaN to the second child, deeper splits to the first.
+  const __mmask16 second = kRoot ? _mm512_cmp_ps_mask(value, threshold, _CMP_NLE_UQ)
+                                 : _mm512_cmp_ps_mask(value, threshold, _CMP_GT_OQ);
+  const __m512i first = _mm512_add_epi32(at, _mm512_srli_epi32(link, kWalkFeatureBits));
+  return _mm512_mask_add_epi32(first, second, first, _mm512_set1_epi32(1));
+}
+
+template <int kPairs>
+__attribute__((target("avx512f"))) void walkAvx512(const WalkNode* nodes, const uint32_t* roots,
+                                                  uint32_t rounds, const float* features,
+                                                  float* leaves) {
+  const FeaturesAvx512<kPairs> x(features);
+  __m512i at[kAvx512Vectors];
+#pragma GCC unroll 8
+  for (int v = 0; v < kAvx512Vectors; ++v) {
+    at[v] = stepAvx512<true>(_mm512_loadu_si512(roots + 16 * v), nodes, x);
+  }
+  for (uint32_t r = 1; r < rounds; ++r) {
+#pragma GCC unroll 8
+    for (int v = 0; v < kAvx512Vectors; ++v) at[v] = stepAvx512<false>(at[v], nodes, x);
+  }
+  const float* values = &nodes->value;
+#pragma GCC unroll 8
+  for (int v = 0; v < kAvx512Vectors; ++v) {
+    _mm512_storeu_ps(leaves + 16 * v, _mm512_mask_i32gather_ps(_mm512_setzero_ps(), 0xFFFF,
+                                                               at[v], values, 8));
+  }
+}
+
+template <bool kRoot>
+__attribute__((target("avx2"))) inline __m256i stepAvx2(__m256i at, const WalkNode* nodes,
+                                                        const float* x) {
+  const auto* words = reinterpret_cast<const long long*>(nodes);
+  const __m256i lo = _mm256_i32gather_epi64(words, _mm256_castsi256_si128(at), 8);
+  const __m256i hi = _mm256_i32gather_epi64(words, _mm256_extracti128_si256(at, 1), 8);
+  // Even words are links, odd ones thresholds; the shuffle leaves the lanes
+  // in the order 0 1 4 5 2 3 6 7, the permute restores it.
+  const __m256 lf = _mm256_castsi256_ps(lo);
+  const __m256 hf = _mm256_castsi256_ps(hi);
+  const __m256i link = _mm256_permute4x64_epi64(
+      _mm256_castps_si256(_mm256_shuffle_ps(lf, hf, _MM_SHUFFLE(2, 0, 2, 0))), _MM_SHUFFLE(3, 1, 2, 0));
+  const __m256 threshold = _mm256_castsi256_ps(_mm256_permute4x64_epi64(
+      _mm256_castps_si256(_mm256_shuffle_ps(lf, hf, _MM_SHUFFLE(3, 1, 3, 1))), _MM_SHUFFLE(3, 1, 2, 0)));
+  const __m256i feature = _mm256_and_si256(link, _mm256_set1_epi32(kWalkMaxFeature));
+  const __m256 value = _mm256_i32gather_ps(x, feature, 4);
+  const __m256 second = kRoot ? _mm256_cmp_ps(value, threshold, _CMP_NLE_UQ)
+                              : _mm256_cmp_ps(value, threshold, _CMP_GT_OQ);
+  // A true comparison is all ones, -1: subtracting it steps to the second child.
+  const __m256i first = _mm256_add_epi32(at, _mm256_srli_epi32(link, kWalkFeatureBits));
+  return _mm256_sub_epi32(first, _mm256_castps_si256(second));
+}
+
+__attribute__((target("avx2"))) void walkAvx2(const WalkNode* nodes, const uint32_t* roots,
+                                              uint32_t rounds, const float* x, float* leaves) {
+  __m256i at[kAvx2Vectors];
+  for (int v = 0; v < kAvx2Vectors; ++v) {
+    const __m256i root = _mm256_loadu_si256(reinterpret_cast<const __m256i*>(roots + 8 * v));
+    at[v] = stepAvx2<true>(root, nodes, x);
+  }
+  for (uint32_t r = 1; r < rounds; ++r) {
+    for (int v = 0; v < kAvx2Vectors; ++v) at[v] = stepAvx2<false>(at[v], nodes, x);
+  }
+  const float* values = &nodes->value;
+  for (int v = 0; v < kAvx2Vectors; ++v) {
+    _mm256_storeu_ps(leaves + 8 * v, _mm256_i32gather_ps(values, at[v], 8));
+  }
+}
+
+}  // namespace
+#endif
+
+namespace {
+void walkScalar(const WalkNode* nodes, const uint32_t* roots, uint32_t rounds, const float* x,
+                float* leaves) {
+  uint32_t at[kWalkGroup];
+  for (size_t k = 0; k < kWalkGroup; ++k) {
+    const WalkNode n = nodes[roots[k]];
+    at[k] = roots[k] + (n.link >> kWalkFeatureBits) +
+            static_cast<uint32_t>(!(x[n.link & kWalkMaxFeature] <= n.value));
+  }
+  for (uint32_t r = 1; r < rounds; ++r) {
+#pragma GCC unroll 16
+    for (size_t k = 0; k < kWalkGroup; ++k) {
+      const WalkNode n = nodes[at[k]];
+      at[k] += (n.link >> kWalkFeatureBits) +
+               static_cast<uint32_t>(x[n.link & kWalkMaxFeature] > n.value);
+    }
+  }
+  for (size_t k = 0; k < kWalkGroup; ++k) leaves[k] = nodes[at[k]].value;
+}
+}  // namespace
+
+bool walkKernelSupported(WalkKernel kernel) {
+  switch (kernel) {
+    case WalkKernel::kPortable:
+    case WalkKernel::kScalar:
+      return true;
+#ifdef RELIQA_WALK_X86
+    case WalkKernel::kAvx2:
+      return __builtin_cpu_supports("avx2");
+    case WalkKernel::kAvx512:
+      return __builtin_cpu_supports("avx512f");
+#endif
+    default:
+      return false;
+  }
+}
+
+WalkKernel bestWalkKernel() {
+  for (WalkKernel k : {WalkKernel::kAvx512, WalkKernel::kAvx2}) {
+    if (walkKernelSupported(k)) return k;
+  }
+  return WalkKernel::kPortable;
+}
+
+void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots, uint32_t rounds,
+               const float* features, size_t slots, float* leaves) {
+  switch (kernel) {
+    case WalkKernel::kScalar:
+      return walkScalar(nodes, roots, rounds, features, leaves);
+#ifdef RELIQA_WALK_X86
+    case WalkKernel::kAvx512:
+      // Few features are picked from registers rather than gathered.
+      switch ((slots + 31) / 32) {
+        case 1:
+          return walkAvx512<1>(nodes, roots, rounds, features, leaves);
+        case 2:
+          return walkAvx512<2>(nodes, roots, rounds, features, leaves);
+        case 3:
+          return walkAvx512<3>(nodes, roots, rounds, features, leaves);
+        case 4:
+          return walkAvx512<4>(nodes, roots, rounds, features, leaves);
+        default:
+          return walkAvx512<0>(nodes, roots, rounds, features, leaves);
+      }
+    case WalkKernel::kAvx2:
+      return walkAvx2(nodes, roots, rounds, features, leaves);
+#endif
+    default:
+      LOG(FATAL) << "walkGroup: no vector kernel " << static_cast<int>(kernel) << " here";
+  }
+}
+
+}  // namespace thornvale
