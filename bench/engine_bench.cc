@@ -5,8 +5,8 @@
 // level a node is a leaf with probability 0.2), as trainers produce them.
 //
 //   Score/<model>/<bits>      unnormalizedScore with the CPU's best kernel
-//   Score<kernel>/<model>/<bits>  the same with the AVX2 gather kernel or the
-//                             portable walk (8 trees in lock step, scalar)
+//   ScoreScalar/<model>/<bits>    the same with the scalar group walk
+//   ScorePortable/<model>/<bits>  the same with 8 compiled trees in lock step
 //   OneByOne/<model>/<bits>   the same sum, one tree after another
 //   Predict/<model>/<bits>    BoostingModel::predict on a FeatureMap, INFO off
 //   Load/<model>              read + compile (BoostingModel construction;
@@ -143,8 +143,7 @@ int main(int argc, char** argv) {
     for (bool sixteen : {true, false}) {
       const std::string suffix = std::string(s.name) + (sixteen ? "/16bit" : "/32bit");
       benchmark::RegisterBenchmark(("Score/" + suffix).c_str(), score, &s, sixteen, true);
-      for (auto [name, kernel] : {std::pair{"ScoreAvx2/", WalkKernel::kAvx2},
-                                  std::pair{"ScoreScalar/", WalkKernel::kScalar},
+      for (auto [name, kernel] : {std::pair{"ScoreScalar/", WalkKernel::kScalar},
                                   std::pair{"ScorePortable/", WalkKernel::kPortable}}) {
         benchmark::RegisterBenchmark((name + suffix).c_str(),
                                      sixteen ? scoreWith<FastTreeEnsembleOOP<short, unsigned>>

@@ -17,13 +17,14 @@
 // splits and x > t at the others, the root included. unnormalizedScore()
 // walks many trees at once so that their memory loads overlap, yet adds the
 // leaves in tree order, so it is bit-identical to unnormalizedScoreOneByOne().
-// On x86-64 CPUs with AVX-512F or AVX2 it walks 32 plain trees per call of a
-// gather kernel (FastTreeEnsembleSimd.h) over a second copy of their nodes,
-// made by init() (8 bytes per node, plus 16 bytes per tree that is a single
-// leaf, and 8 bytes per tree); elsewhere it walks 8 trees in lock step in scalar
-// code. Trees with equality features, deeper than kMaxGatherDepth or with
-// more than kWalkMaxDistance nodes, and forests reading more than
-// kMaxGatherFeatures positions, take the scalar walks.
+// It walks kWalkGroup plain trees per call of a kernel (FastTreeEnsembleSimd.h:
+// AVX-512 where the CPU has it, else scalar) over a second copy of their
+// nodes made by init(): 8 bytes per node, 16 more per tree that is a single
+// leaf, and 8 bytes per tree. Without that copy, or when a test asks for
+// WalkKernel::kPortable, it walks 8 compiled trees in lock step. Trees with
+// equality features, deeper than kMaxGatherDepth or with more than
+// kWalkMaxDistance nodes, and forests reading more than kMaxGatherFeatures
+// positions, are not copied and take the walks of the compiled trees.
 //
 // Errors: init() returns false for a null forest and (after an ERROR log) for
 // a decreasing modelIndexMap; it throws std::range_error when a split's

@@ -12,10 +12,9 @@ namespace thornvale {
 #ifdef RELIQA_WALK_X86
 namespace {
 
-// Several independent vectors per group keep enough gathers in flight to
-// hide their latency; each step of a lane depends on the one before.
+// Many independent vectors per group keep enough loads in flight to hide
+// their latency; each step of a lane depends on the one before.
 constexpr int kAvx512Vectors = kWalkGroup / 16;
-constexpr int kAvx2Vectors = kWalkGroup / 8;
 
 // The feature values that a step compares: gathered from memory, or, for
 // up to 32 * kPairs slots, picked from registers that hold them all.
@@ -86,49 +85,12 @@ __attribute__((target("avx512f"))) void walkAvx512(const WalkNode* nodes, const 
   }
 }
 
-template <bool kRoot>
-__attribute__((target("avx2"))) inline __m256i stepAvx2(__m256i at, const WalkNode* nodes,
-                                                        const float* x) {
-  const auto* words = reinterpret_cast<const long long*>(nodes);
-  const __m256i lo = _mm256_i32gather_epi64(words, _mm256_castsi256_si128(at), 8);
-  const __m256i hi = _mm256_i32gather_epi64(words, _mm256_extracti128_si256(at, 1), 8);
-  // Even words are links, odd ones thresholds; the shuffle leaves the lanes
-  // in the order 0 1 4 5 2 3 6 7, the permute restores it.
-  const __m256 lf = _mm256_castsi256_ps(lo);
-  const __m256 hf = _mm256_castsi256_ps(hi);
-  const __m256i link = _mm256_permute4x64_epi64(
-      _mm256_castps_si256(_mm256_shuffle_ps(lf, hf, _MM_SHUFFLE(2, 0, 2, 0))), _MM_SHUFFLE(3, 1, 2, 0));
-  const __m256 threshold = _mm256_castsi256_ps(_mm256_permute4x64_epi64(
-      _mm256_castps_si256(_mm256_shuffle_ps(lf, hf, _MM_SHUFFLE(3, 1, 3, 1))), _MM_SHUFFLE(3, 1, 2, 0)));
-  const __m256i feature = _mm256_and_si256(link, _mm256_set1_epi32(kWalkMaxFeature));
-  const __m256 value = _mm256_i32gather_ps(x, feature, 4);
-  const __m256 second = kRoot ? _mm256_cmp_ps(value, threshold, _CMP_NLE_UQ)
-                              : _mm256_cmp_ps(value, threshold, _CMP_GT_OQ);
-  // A true comparison is all ones, -1: subtracting it steps to the second child.
-  const __m256i first = _mm256_add_epi32(at, _mm256_srli_epi32(link, kWalkFeatureBits));
-  return _mm256_sub_epi32(first, _mm256_castps_si256(second));
-}
-
-__attribute__((target("avx2"))) void walkAvx2(const WalkNode* nodes, const uint32_t* roots,
-                                              uint32_t rounds, const float* x, float* leaves) {
-  __m256i at[kAvx2Vectors];
-  for (int v = 0; v < kAvx2Vectors; ++v) {
-    const __m256i root = _mm256_loadu_si256(reinterpret_cast<const __m256i*>(roots + 8 * v));
-    at[v] = stepAvx2<true>(root, nodes, x);
-  }
-  for (uint32_t r = 1; r < rounds; ++r) {
-    for (int v = 0; v < kAvx2Vectors; ++v) at[v] = stepAvx2<false>(at[v], nodes, x);
-  }
-  const float* values = &nodes->value;
-  for (int v = 0; v < kAvx2Vectors; ++v) {
-    _mm256_storeu_ps(leaves + 8 * v, _mm256_i32gather_ps(values, at[v], 8));
-  }
-}
-
 }  // namespace
 #endif
 
 namespace {
+// Lane after lane, one level per round; with this many independent lanes the
+// loads of one round overlap as well.
 void walkScalar(const WalkNode* nodes, const uint32_t* roots, uint32_t rounds, const float* x,
                 float* leaves) {
   uint32_t at[kWalkGroup];
@@ -155,8 +117,6 @@ bool walkKernelSupported(WalkKernel kernel) {
     case WalkKernel::kScalar:
       return true;
 #ifdef RELIQA_WALK_X86
-    case WalkKernel::kAvx2:
-      return __builtin_cpu_supports("avx2");
     case WalkKernel::kAvx512:
       return __builtin_cpu_supports("avx512f");
 #endif
@@ -166,10 +126,7 @@ bool walkKernelSupported(WalkKernel kernel) {
 }
 
 WalkKernel bestWalkKernel() {
-  for (WalkKernel k : {WalkKernel::kAvx512, WalkKernel::kAvx2}) {
-    if (walkKernelSupported(k)) return k;
-  }
-  return WalkKernel::kPortable;
+  return walkKernelSupported(WalkKernel::kAvx512) ? WalkKernel::kAvx512 : WalkKernel::kScalar;
 }
 
 void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots, uint32_t rounds,
@@ -192,8 +149,6 @@ void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots, 
         default:
           return walkAvx512<0>(nodes, roots, rounds, features, leaves);
       }
-    case WalkKernel::kAvx2:
-      return walkAvx2(nodes, roots, rounds, features, leaves);
 #endif
     default:
       LOG(FATAL) << "walkGroup: no vector kernel " << static_cast<int>(kernel) << " here";

@@ -1,4 +1,4 @@
-// Vector kernels that walk a group of compiled trees at once with gathers.
+// Kernels that walk a group of compiled trees at once, in lock step.
 //
 // The trees to walk live in one array of 8-byte WalkNode, so that a single
 // gather base serves every lane and one 64-bit load brings a whole node; a
@@ -10,7 +10,7 @@
 // split; a tree that is one leaf gets a root on the NaN slot whose two
 // children are that leaf.
 //
-// walkGroup() runs `rounds` steps for kWalkGroup lanes: the first step goes to
+// walkGroup() runs `rounds` steps for kWalkGroup lanes (trees): the first step goes to
 // the second child unless x <= t, the later ones when x > t (the plain walk's
 // NaN rule), then stores the threshold of each lane's node, its leaf value.
 // The caller guarantees that every root offset, every `next` and every
@@ -18,8 +18,10 @@
 // included), and that every node index fits in a signed 32-bit integer: the
 // gathers read nothing else.
 //
-// Kernels exist for x86-64 CPUs with AVX2 or AVX-512F and are chosen at run
-// time; elsewhere only the portable walk of the compiled forest exists.
+// A scalar kernel runs on any CPU; on x86-64 CPUs with AVX-512F a vector
+// kernel walks 16 lanes per instruction, gathering the nodes and, for up to
+// 128 feature slots, picking the features from registers. The kernel is
+// chosen at run time; nothing needs AVX-512 at build time.
 // Thread-safe: the functions have no state.
 #pragma once
 
@@ -46,14 +48,13 @@ constexpr WalkNode walkNode(uint32_t feature, uint32_t distance, float value) {
 }
 
 enum class WalkKernel {
-  kPortable,  // one tree per lane in scalar code (any CPU)
-  kScalar,    // the walk nodes, one lane after another (any CPU)
-  kAvx2,      // 8 lanes per vector
-  kAvx512,    // 16 lanes per vector
+  kPortable,  // no walk nodes: 8 compiled trees in lock step (any CPU)
+  kScalar,    // walkGroup() in scalar code (any CPU)
+  kAvx512,    // walkGroup() with 16 lanes per vector
 };
 
 // Trees walked per call of walkGroup().
-constexpr size_t kWalkGroup = 64;
+constexpr size_t kWalkGroup = 128;
 
 // Whether this CPU (and build) can run `kernel`.
 bool walkKernelSupported(WalkKernel kernel);

@@ -333,5 +333,95 @@ void checkAgainstReference(uint64_t seed) {
 TEST(Scoring, InterleavedEqualsReference16) { checkAgainstReference<Forest16>(1); }
 TEST(Scoring, InterleavedEqualsReference32) { checkAgainstReference<Forest32>(2); }
 
+// Every walk kernel this CPU runs must give the one-by-one sum bit for bit.
+// The forests mix what the kernels treat differently: ragged and full trees
+// of depth 1 to 10, single leaves, trees with equality splits and trees too
+// deep for a group (walked apart), tree counts around the group size,
+// sub-models that start inside a group, and feature counts on both sides of
+// what the vector kernel keeps in registers. The inputs hit thresholds, NaN
+// and infinities.
+template <typename E>
+void checkKernels(uint64_t seed, int32_t numFeatures) {
+  std::vector<WalkKernel> kernels{WalkKernel::kPortable, WalkKernel::kScalar};
+  if (walkKernelSupported(WalkKernel::kAvx512)) kernels.push_back(WalkKernel::kAvx512);
+  std::mt19937_64 rng(seed);
+  for (int round = 0; round < 6; ++round) {
+    const size_t count = 1 + rng() % (2 * kWalkGroup + 20);
+    Forest f = testing::randomForest(rng(), count, 1 + static_cast<int>(rng() % 10), numFeatures,
+                                     false, round % 2 ? 0.3 : 0.0);
+    for (size_t i = 0; i < count; i += 1 + rng() % 16) {
+      switch (rng() % 4) {
+        case 0: f.trees[i].tree->root = leaf(0.25 * static_cast<double>(i)); break;
+        case 1: f.trees[i].weight = 0.0; break;
+        case 2: f.trees[i].tree->root = testing::randomFullTree(rng, 1 + rng() % 10, numFeatures, 0.4); break;
+        default: f.trees[i].tree->root = testing::chain(E::kMaxGatherDepth + 1 + rng() % 3, numFeatures - 1);
+      }
+    }
+    if (round % 3 == 1) f.equalityFeatures = {static_cast<uint32_t>(rng() % numFeatures)};
+    if (round % 3 == 2) {  // selector leaves 0, 1, 2: the ranges start inside groups
+      f.modelSelector = weighted(split(0, 0.0, leaf(0.5), split(1, 0.5, leaf(1.5), leaf(2.5))), 1);
+      f.modelIndexMap = {static_cast<uint32_t>(count / 3), static_cast<uint32_t>(count / 3 + 37)};
+    }
+    auto e = compiled<E>(f);
+    ASSERT_GT(e->gatherBytes(), 0u) << "the group walk must be in use";
+    std::vector<float> thresholds;
+    for (const auto& t : e->getTrees()) {
+      for (const auto& n : t.nodes) {
+        if (n.featureId != E::kLeaf) thresholds.push_back(n.value);
+      }
+    }
+    const float specials[] = {kNaN, std::numeric_limits<float>::infinity(),
+                              -std::numeric_limits<float>::infinity(), 0.0f, -0.0f};
+    std::uniform_real_distribution<float> u(-1.2f, 1.2f);
+    for (int v = 0; v < 40; ++v) {
+      std::vector<float> x(static_cast<size_t>(numFeatures));
+      for (float& xi : x) {
+        const auto r = rng() % 8;
+        xi = r == 0   ? specials[rng() % 5]
+             : r < 3 && !thresholds.empty() ? thresholds[rng() % thresholds.size()]
+                                            : u(rng);
+      }
+      if (v % 4 == 0) x[static_cast<size_t>(numFeatures) - 1] = 100.0f;  // deep chains to the end
+      const double expected = e->unnormalizedScoreOneByOne(x);
+      for (WalkKernel k : kernels) {
+        ASSERT_TRUE(e->useWalkKernel(k));
+        ASSERT_TRUE(testing::sameBits(e->unnormalizedScore(x), expected))
+            << "kernel " << static_cast<int>(k) << ", round " << round << ", vector " << v;
+      }
+    }
+  }
+}
+
+TEST(Kernels, AllKernelsGiveTheOneByOneSum16) {
+  for (int32_t features : {2, 31, 74, 100, 127, 300}) checkKernels<Forest16>(features, features);
+}
+TEST(Kernels, AllKernelsGiveTheOneByOneSum32) {
+  for (int32_t features : {3, 32, 64, 96, 128, 1000}) checkKernels<Forest32>(features + 7, features);
+}
+
+TEST(Kernels, ForestsWithoutGroupWalk) {
+  // Leaves only: nothing is read from the (empty) vector.
+  Forest leaves;
+  leaves.baseScore = 0.125;
+  for (int i = 0; i < 200; ++i) leaves.trees.push_back(weighted(leaf(i), 0.5));
+  auto e = compiled(leaves);
+  EXPECT_GT(e->gatherBytes(), 0u);
+  EXPECT_TRUE(testing::sameBits(e->unnormalizedScore({}), e->unnormalizedScoreOneByOne({})));
+
+  // Too many feature positions for the copy on the stack, and only trees
+  // that the group walk does not take: no walk nodes, the compiled walks.
+  Forest wide = testing::randomForest(5, 20, 4, 3000);
+  auto w = compiled(wide);
+  Forest eq = mapped(4);
+  for (int i = 0; i < 20; ++i) eq.trees.push_back(weighted(split(3, 0.5, leaf(1), leaf(i)), 1));
+  eq.equalityFeatures = {3};
+  auto q = compiled(eq);
+  EXPECT_EQ(w->gatherBytes(), 0u);
+  EXPECT_EQ(q->gatherBytes(), 0u);
+  std::vector<float> x(3000, 0.5f);
+  EXPECT_TRUE(testing::sameBits(w->unnormalizedScore(x), w->unnormalizedScoreOneByOne(x)));
+  EXPECT_TRUE(testing::sameBits(q->unnormalizedScore(x), q->unnormalizedScoreOneByOne(x)));
+}
+
 }  // namespace
 }  // namespace thornvale
