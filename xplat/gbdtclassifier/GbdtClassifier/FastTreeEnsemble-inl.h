@@ -20,7 +20,7 @@
 // It walks kWalkGroup plain trees per call of a kernel (FastTreeEnsembleSimd.h:
 // AVX-512 where the CPU has it, else scalar) over a second copy of their
 // nodes made by init(): 8 bytes per node, 16 more per tree that is a single
-// leaf, and 8 bytes per tree. Without that copy, or when a test asks for
+// leaf, and 16 bytes per tree. Without that copy, or when a test asks for
 // WalkKernel::kPortable, it walks 8 compiled trees in lock step. Trees with
 // equality features, deeper than kMaxGatherDepth or with more than
 // kWalkMaxDistance nodes, and forests reading more than kMaxGatherFeatures
@@ -168,7 +168,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
   // Bytes held by the copy of the nodes that the gather kernels walk.
   size_t gatherBytes() const {
-    return gatherNodes_.size() * sizeof(WalkNode) +
+    return (gatherNodes_.size() + gatherRootNode_.size()) * sizeof(WalkNode) +
            (gatherRoot_.size() + gatherDepth_.size()) * sizeof(uint32_t);
   }
 
@@ -349,9 +349,9 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   static bool gatherable(const FlatTree& tree);
   void buildGatherNodes();
 
-  // Groups of kWalkGroup consecutive trees go to the gather kernel; lanes
-  // past `end` and lanes of trees that the kernel does not take walk the
-  // constant tree at index 0, and the latter are walked here instead.
+  // Groups of kWalkGroup consecutive trees go to the kernel; lanes of trees
+  // that it does not take walk the constant tree at index 0, and those trees
+  // are walked here instead.
   double sumGathered(const float* features, size_t first, size_t end) const {
     // The features, the NaN slot, and NaN up to a multiple of 32 entries.
     alignas(64) float x[(kMaxGatherFeatures + 32) / 32 * 32];
@@ -360,17 +360,14 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     const size_t slots = used + 1;
     std::fill(x + used, x + (slots + 31) / 32 * 32, std::numeric_limits<float>::quiet_NaN());
     double sum = baseScore_;
-    uint32_t roots[kWalkGroup];
     float leaves[kWalkGroup];
     for (size_t i = first; i < end; i += kWalkGroup) {
+      // Lanes past `end` walk the trees (or padding) that follow, unused.
       const size_t n = std::min(kWalkGroup, end - i);
       uint32_t rounds = 1;
-      for (size_t k = 0; k < n; ++k) {
-        roots[k] = gatherRoot_[i + k];
-        rounds = std::max(rounds, gatherDepth_[i + k]);
-      }
-      std::fill(roots + n, roots + kWalkGroup, 0u);
-      walkGroup(kernel_, gatherNodes_.data(), roots, rounds, x, slots, leaves);
+      for (size_t k = 0; k < n; ++k) rounds = std::max(rounds, gatherDepth_[i + k]);
+      walkGroup(kernel_, gatherNodes_.data(), gatherRoot_.data() + i, gatherRootNode_.data() + i,
+                rounds, x, slots, leaves);
       for (size_t k = 0; k < n; ++k) {
         const float v = gatherDepth_[i + k] != 0 ? leaves[k] : leafValue(trees_[i + k], features);
         sum += static_cast<double>(v);
@@ -390,10 +387,13 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   // The plain trees again, for the gather kernels (see FastTreeEnsembleSimd.h):
   // the constant tree (value 0) at index 0, then one tree after another.
   // gatherRoot_[i] is the index of tree i's root (0 for a tree that the
-  // kernels do not take), gatherDepth_[i] its number of steps (0 for such a
-  // tree). All empty when the kernels cannot be used for this forest.
+  // kernels do not take), gatherRootNode_[i] a copy of that node, both
+  // followed by kWalkGroup entries of the constant tree; gatherDepth_[i] is
+  // tree i's number of steps (0 for a tree that the kernels do not take).
+  // All empty when the kernels cannot be used for this forest.
   std::vector<WalkNode> gatherNodes_;
   std::vector<uint32_t> gatherRoot_;
+  std::vector<WalkNode> gatherRootNode_;
   std::vector<uint32_t> gatherDepth_;
   WalkKernel kernel_ = bestWalkKernel();
 };
@@ -404,6 +404,7 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
   trees_.clear();
   gatherNodes_.clear();
   gatherRoot_.clear();
+  gatherRootNode_.clear();
   gatherDepth_.clear();
   baseScore_ = forest->baseScore;
   featureMapping_ = forest->featureMapping;
@@ -469,7 +470,7 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildGatherNodes() {
     nodes.push_back(walkNode(nanSlot, 0, value));
   };
   constantTree(0.0f);
-  gatherRoot_.assign(trees_.size(), 0);
+  gatherRoot_.assign(trees_.size() + kWalkGroup, 0);
   gatherDepth_.assign(trees_.size(), 0);
   bool any = false;
   for (size_t i = 0; i < trees_.size(); ++i) {
@@ -496,6 +497,8 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildGatherNodes() {
     gatherDepth_.clear();
     return;
   }
+  gatherRootNode_.reserve(gatherRoot_.size());
+  for (uint32_t root : gatherRoot_) gatherRootNode_.push_back(nodes[root]);
   gatherNodes_ = std::move(nodes);
 }
 

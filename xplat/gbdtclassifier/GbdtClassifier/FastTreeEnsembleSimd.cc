@@ -44,15 +44,23 @@ struct FeaturesAvx512 {
 
 // One step of 16 lanes: gather the 16 nodes (two 64-bit gathers), split them
 // into links and thresholds, fetch the features, compare, move on.
+// The roots need no gather: they are the given copies, 16 in a row.
 template <bool kRoot, typename Features>
 __attribute__((target("avx512f"))) inline __m512i stepAvx512(__m512i at, const WalkNode* nodes,
+                                                             const WalkNode* roots,
                                                              const Features& x) {
   const __m512i even = _mm512_setr_epi32(0, 2, 4, 6, 8, 10, 12, 14, 16, 18, 20, 22, 24, 26, 28, 30);
   const __m512i odd = _mm512_setr_epi32(1, 3, 5, 7, 9, 11, 13, 15, 17, 19, 21, 23, 25, 27, 29, 31);
-  const __m512i lo = _mm512_mask_i32gather_epi64(_mm512_setzero_si512(), 0xFF,
-                                                 _mm512_castsi512_si256(at), nodes, 8);
-  const __m512i hi = _mm512_mask_i32gather_epi64(_mm512_setzero_si512(), 0xFF,
-                                                 _mm512_extracti64x4_epi64(at, 1), nodes, 8);
+  __m512i lo, hi;
+  if constexpr (kRoot) {
+    lo = _mm512_loadu_si512(roots);
+    hi = _mm512_loadu_si512(roots + 8);
+  } else {
+    lo = _mm512_mask_i32gather_epi64(_mm512_setzero_si512(), 0xFF, _mm512_castsi512_si256(at),
+                                     nodes, 8);
+    hi = _mm512_mask_i32gather_epi64(_mm512_setzero_si512(), 0xFF,
+                                     _mm512_extracti64x4_epi64(at, 1), nodes, 8);
+  }
   const __m512i link = _mm512_permutex2var_epi32(lo, even, hi);
   const __m512 threshold = _mm512_castsi512_ps(_mm512_permutex2var_epi32(lo, odd, hi));
   const __m512 value = x(_mm512_and_si512(link, _mm512_set1_epi32(kWalkMaxFeature)));
@@ -65,17 +73,17 @@ __attribute__((target("avx512f"))) inline __m512i stepAvx512(__m512i at, const W
 
 template <int kPairs>
 __attribute__((target("avx512f"))) void walkAvx512(const WalkNode* nodes, const uint32_t* roots,
-                                                  uint32_t rounds, const float* features,
-                                                  float* leaves) {
+                                                  const WalkNode* rootNodes, uint32_t rounds,
+                                                  const float* features, float* leaves) {
   const FeaturesAvx512<kPairs> x(features);
   __m512i at[kAvx512Vectors];
 #pragma GCC unroll 8
   for (int v = 0; v < kAvx512Vectors; ++v) {
-    at[v] = stepAvx512<true>(_mm512_loadu_si512(roots + 16 * v), nodes, x);
+    at[v] = stepAvx512<true>(_mm512_loadu_si512(roots + 16 * v), nodes, rootNodes + 16 * v, x);
   }
   for (uint32_t r = 1; r < rounds; ++r) {
 #pragma GCC unroll 8
-    for (int v = 0; v < kAvx512Vectors; ++v) at[v] = stepAvx512<false>(at[v], nodes, x);
+    for (int v = 0; v < kAvx512Vectors; ++v) at[v] = stepAvx512<false>(at[v], nodes, nullptr, x);
   }
   const float* values = &nodes->value;
 #pragma GCC unroll 8
@@ -91,11 +99,11 @@ __attribute__((target("avx512f"))) void walkAvx512(const WalkNode* nodes, const 
 namespace {
 // Lane after lane, one level per round; with this many independent lanes the
 // loads of one round overlap as well.
-void walkScalar(const WalkNode* nodes, const uint32_t* roots, uint32_t rounds, const float* x,
-                float* leaves) {
+void walkScalar(const WalkNode* nodes, const uint32_t* roots, const WalkNode* rootNodes,
+                uint32_t rounds, const float* x, float* leaves) {
   uint32_t at[kWalkGroup];
   for (size_t k = 0; k < kWalkGroup; ++k) {
-    const WalkNode n = nodes[roots[k]];
+    const WalkNode n = rootNodes[k];
     at[k] = roots[k] + (n.link >> kWalkFeatureBits) +
             static_cast<uint32_t>(!(x[n.link & kWalkMaxFeature] <= n.value));
   }
@@ -129,25 +137,26 @@ WalkKernel bestWalkKernel() {
   return walkKernelSupported(WalkKernel::kAvx512) ? WalkKernel::kAvx512 : WalkKernel::kScalar;
 }
 
-void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots, uint32_t rounds,
-               const float* features, size_t slots, float* leaves) {
+void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots,
+               const WalkNode* rootNodes, uint32_t rounds, const float* features, size_t slots,
+               float* leaves) {
   switch (kernel) {
     case WalkKernel::kScalar:
-      return walkScalar(nodes, roots, rounds, features, leaves);
+      return walkScalar(nodes, roots, rootNodes, rounds, features, leaves);
 #ifdef RELIQA_WALK_X86
     case WalkKernel::kAvx512:
       // Few features are picked from registers rather than gathered.
       switch ((slots + 31) / 32) {
         case 1:
-          return walkAvx512<1>(nodes, roots, rounds, features, leaves);
+          return walkAvx512<1>(nodes, roots, rootNodes, rounds, features, leaves);
         case 2:
-          return walkAvx512<2>(nodes, roots, rounds, features, leaves);
+          return walkAvx512<2>(nodes, roots, rootNodes, rounds, features, leaves);
         case 3:
-          return walkAvx512<3>(nodes, roots, rounds, features, leaves);
+          return walkAvx512<3>(nodes, roots, rootNodes, rounds, features, leaves);
         case 4:
-          return walkAvx512<4>(nodes, roots, rounds, features, leaves);
+          return walkAvx512<4>(nodes, roots, rootNodes, rounds, features, leaves);
         default:
-          return walkAvx512<0>(nodes, roots, rounds, features, leaves);
+          return walkAvx512<0>(nodes, roots, rootNodes, rounds, features, leaves);
       }
 #endif
     default:

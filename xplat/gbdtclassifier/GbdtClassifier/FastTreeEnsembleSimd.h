@@ -61,11 +61,13 @@ bool walkKernelSupported(WalkKernel kernel);
 // The fastest kernel this CPU can run.
 WalkKernel bestWalkKernel();
 
-// Walks kWalkGroup trees from `roots` (node indices) for `rounds` >= 1 steps
-// and stores their leaf values in `leaves`. `features` holds `slots` values
+// Walks kWalkGroup trees from `roots` (node indices; `rootNodes` holds copies
+// of those nodes) for `rounds` >= 1 steps and stores their leaf values in
+// `leaves`. `features` holds `slots` values
 // and is readable up to the next multiple of 32 (kernels may load whole
 // registers of it). `kernel` must be supported and not kPortable.
-void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots, uint32_t rounds,
-               const float* features, size_t slots, float* leaves);
+void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots,
+               const WalkNode* rootNodes, uint32_t rounds, const float* features, size_t slots,
+               float* leaves);
 
 }  // namespace thornvale
