@@ -4,6 +4,12 @@
 
 #if defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
 #define RELIQA_WALK_X86 1
+#if defined(__GNUC__) && !defined(__clang__)
+// Some GCC versions warn inside their own AVX-512 intrinsics, whose unused
+// pass-through operands are deliberately undefined.
+#pragma GCC diagnostic ignored "-Wuninitialized"
+#pragma GCC diagnostic ignored "-Wmaybe-uninitialized"
+#endif
 #include <immintrin.h>
 #endif
 
