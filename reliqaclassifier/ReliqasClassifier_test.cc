@@ -310,7 +310,9 @@ TEST(ReliqasClassifierConcurrencyTest, ResultsMatchSomeStateThatExisted) {
   // classifier: an update's model (or, when its text is empty or rejected,
   // either earlier model) with that update's identifier and threshold. For a
   // second classifier over the same store: the model it loaded with any
-  // stored identifier and threshold.
+  // stored identifier and any stored threshold. The entries are written one
+  // by one, and its own lock does not keep the other classifier from writing
+  // between its two reads, so the pair need not come from one update.
   using Key = std::tuple<std::string, std::string, std::string, std::vector<std::pair<int32_t, double>>>;
   auto key = [](const ReliqaClassifierResult& result) {
     FeatureMap vector = featureVectorOf(result);
@@ -334,9 +336,12 @@ TEST(ReliqasClassifierConcurrencyTest, ResultsMatchSomeStateThatExisted) {
           }
           classifier.setServerFeatures(server);
           for (const ReliqaClassifierInput& input : inputs) {
-            Key answer = key(classifier.classify(input));
-            if (!keepModel) updatedAnswers.insert(answer);
-            if (keepModel && model == models[0]) sharingAnswers.insert(answer);
+            if (!keepModel) updatedAnswers.insert(key(classifier.classify(input)));
+          }
+          if (!keepModel || model != models[0]) continue;
+          for (const Params& thresholdFrom : updates) {
+            classifier.setModelParams({"", params.id, thresholdFrom.threshold});
+            for (const ReliqaClassifierInput& input : inputs) sharingAnswers.insert(key(classifier.classify(input)));
           }
         }
       }
