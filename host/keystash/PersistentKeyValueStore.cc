@@ -16,9 +16,10 @@ namespace kestrova::mobile::xplat::keystash {
 namespace {
 
 // A 64-bit counter in a small file beside the database, mapped into memory and
-// shared by every store over that database in every process. Each completed
-// write increments it, so a store can tell without any system call whether the
-// entries it has cached may be out of date.
+// shared by every store over that database in every process. Every write
+// increments it while it holds SQLite's write lock, before it commits, so a
+// store can tell without any system call whether the entries it has cached may
+// be out of date, and a writer that dies after its commit has already told.
 class ChangeCounter {
  public:
   // Null when the counter file cannot be set up; the store then reads the
@@ -61,7 +62,7 @@ bool cacheable(const std::optional<PersistentKeyValueStore::Entry>& entry) {
 
 }  // namespace
 
-// One SQLite connection with its two prepared statements, used under `mutex`.
+// One SQLite connection with its prepared statements, used under `mutex`.
 class PersistentKeyValueStore::Database {
  public:
   explicit Database(const std::string& path) : path_(path), counter_(ChangeCounter::open(path + "-changes")) {
@@ -85,6 +86,9 @@ class PersistentKeyValueStore::Database {
       upsert_ = prepare(
           "INSERT INTO entries(key, value, extra) VALUES(?1, ?2, ?3) "
           "ON CONFLICT(key) DO UPDATE SET value = excluded.value, extra = excluded.extra");
+      begin_ = prepare("BEGIN IMMEDIATE");
+      commit_ = prepare("COMMIT");
+      rollback_ = prepare("ROLLBACK");
     } catch (...) {
       close();
       throw;
@@ -93,40 +97,73 @@ class PersistentKeyValueStore::Database {
 
   ~Database() { close(); }
 
-  // Served from the cache while no write has completed since it was filled
-  // (the change counter is read before the database, so a write that lands
-  // in between only makes the cache newer than its mark, never older).
+  // Served from memory while the counter shows that no write has begun since
+  // memory was filled. Memory is filled under SQLite's write lock: no write is
+  // then between its announcement and its commit, so the counter read there
+  // belongs exactly to the state that is read. Should the lock not be had (a
+  // read-only file, a writer holding it too long), the entry is read without
+  // being kept.
   std::optional<Entry> fetch(const std::string& key) {
     std::lock_guard<std::mutex> lock(mutex_);
     if (!counter_) return read(key);
-    const uint64_t changes = counter_->load();
-    if (changes != cachedChanges_ || cache_.size() >= kMaxCachedKeys) {
+    if (counter_->load() != cachedChanges_ || cache_.size() >= kMaxCachedKeys) {
+      cache_.clear();
+      cachedChanges_ = kNotCached;
+    } else {
+      auto cached = cache_.find(key);
+      if (cached != cache_.end()) return cached->second;
+    }
+    if (!step(begin_)) return read(key);
+    uint64_t changes;
+    std::optional<Entry> entry;
+    try {
+      changes = counter_->load();
+      entry = read(key);
+    } catch (...) {
+      step(rollback_);
+      throw;
+    }
+    step(rollback_);  // nothing was written
+    if (changes != cachedChanges_) {
       cache_.clear();
       cachedChanges_ = changes;
     }
-    auto cached = cache_.find(key);
-    if (cached != cache_.end()) return cached->second;
-    std::optional<Entry> entry = read(key);
     if (cacheable(entry)) cache_.emplace(key, entry);
     return entry;
   }
 
+  // One transaction that announces itself on the counter before it commits.
+  // When nobody else wrote since memory was filled, memory stays valid with
+  // this entry replaced.
   void store(const std::string& key, const FileUtils::BinaryData& value, const FileUtils::BinaryData& extra) {
     std::lock_guard<std::mutex> lock(mutex_);
-    write(key, value, extra);
-    if (!counter_) return;
-    // Committed: announce it. When nobody else wrote since the cache was
-    // filled, the cache stays valid with this entry replaced.
-    if (counter_->increment() == cachedChanges_) {
-      ++cachedChanges_;
-      std::optional<Entry> entry = Entry{value, extra.toString()};
-      if (cacheable(entry)) {
-        cache_[key] = std::move(entry);
-      } else {
-        cache_.erase(key);
-      }
-    } else {
+    if (!counter_) {
+      write(key, value, extra);
+      return;
+    }
+    if (!step(begin_)) fail("store", key);
+    uint64_t before;
+    try {
+      write(key, value, extra);
+      before = counter_->increment();
+      if (!step(commit_)) fail("store", key);
+    } catch (...) {
+      step(rollback_);
       cache_.clear();
+      cachedChanges_ = kNotCached;
+      throw;
+    }
+    if (before != cachedChanges_) {
+      cache_.clear();
+      cachedChanges_ = kNotCached;
+      return;
+    }
+    cachedChanges_ = before + 1;
+    std::optional<Entry> entry = Entry{value, extra.toString()};
+    if (cacheable(entry)) {
+      cache_[key] = std::move(entry);
+    } else {
+      cache_.erase(key);
     }
   }
 
@@ -151,6 +188,12 @@ class PersistentKeyValueStore::Database {
     bindBlob(upsert_, 2, value);
     bindBlob(upsert_, 3, extra);
     if (sqlite3_step(upsert_) != SQLITE_DONE) fail("store", key);
+  }
+
+  // Runs a statement without result rows; false when SQLite refused it.
+  bool step(sqlite3_stmt* statement) {
+    Reset reset{statement};
+    return sqlite3_step(statement) == SQLITE_DONE;
   }
 
   // Leaves a statement ready for its next use, whatever happened.
@@ -201,8 +244,11 @@ class PersistentKeyValueStore::Database {
   void close() {
     sqlite3_finalize(select_);
     sqlite3_finalize(upsert_);
+    sqlite3_finalize(begin_);
+    sqlite3_finalize(commit_);
+    sqlite3_finalize(rollback_);
     sqlite3_close(db_);
-    select_ = upsert_ = nullptr;
+    select_ = upsert_ = begin_ = commit_ = rollback_ = nullptr;
     db_ = nullptr;
   }
 
@@ -210,10 +256,14 @@ class PersistentKeyValueStore::Database {
   std::unique_ptr<ChangeCounter> counter_;
   std::mutex mutex_;
   std::unordered_map<std::string, std::optional<Entry>> cache_;
-  uint64_t cachedChanges_ = UINT64_MAX;  // counter value that cache_ is current for
+  static constexpr uint64_t kNotCached = UINT64_MAX;
+  uint64_t cachedChanges_ = kNotCached;  // counter value that cache_ is current for
   sqlite3* db_ = nullptr;
   sqlite3_stmt* select_ = nullptr;
   sqlite3_stmt* upsert_ = nullptr;
+  sqlite3_stmt* begin_ = nullptr;
+  sqlite3_stmt* commit_ = nullptr;
+  sqlite3_stmt* rollback_ = nullptr;
 };
 
 PersistentKeyValueStore::PersistentKeyValueStore(const std::string& databasePath)

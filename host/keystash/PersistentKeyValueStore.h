@@ -14,10 +14,12 @@
 //     database, a full disk, a database locked by another process for more than
 //     five seconds) arrive as std::runtime_error from the future's get().
 //   - Reads are cheap: small entries are kept in memory and served from there
-//     until any store object over the file (in any process) completes a write,
-//     which it announces through a counter in the file "<databasePath>-changes".
-//     Write the database only through this class, or other live stores may go
-//     on serving what they had read.
+//     until any store object over the file (in any process) begins a write,
+//     which it announces through a counter in the file "<databasePath>-changes"
+//     before it commits (so also a writer killed right after its commit has
+//     announced it). Write the database only through this class, and keep the
+//     two files together, or other live stores may go on serving what they had
+//     read. A read that has to go to the file waits for a write in progress.
 //
 // Thread-safety: any number of threads may call fetch and store at once; calls
 // on one object are serialised internally. Several objects, also in several

@@ -92,6 +92,33 @@ TEST(PersistentKeyValueStoreTest, StoresOverOneFileSeeEachOthersWrites) {
   EXPECT_EQ(read(first, "big"), "small");
 }
 
+// Reads from one store race with writes through another: once a write has
+// returned, no read may still give an older value, whatever the reader had
+// put in memory while the write was in progress.
+TEST(PersistentKeyValueStoreTest, NoReadAfterAWriteReturnsAnOlderValue) {
+  TemporaryDirectory dir;
+  PersistentKeyValueStore writer(dir.file("kv.db"));
+  PersistentKeyValueStore reader(dir.file("kv.db"));
+  write(writer, "k", "0");
+  constexpr int kWrites = 200;
+  std::atomic<int> written{0};
+  std::atomic<int> stale{0};
+  std::thread readerThread([&] {
+    while (written < kWrites) {
+      const int before = written;
+      const int value = std::stoi(read(reader, "k").value_or("-1"));
+      if (value < before) ++stale;
+    }
+  });
+  for (int i = 1; i <= kWrites; ++i) {
+    write(writer, "k", std::to_string(i));
+    written = i;
+  }
+  readerThread.join();
+  EXPECT_EQ(stale, 0);
+  EXPECT_EQ(read(reader, "k"), std::to_string(kWrites));
+}
+
 TEST(PersistentKeyValueStoreTest, ConcurrentWritersNeverTearAValue) {
   TemporaryDirectory dir;
   PersistentKeyValueStore first(dir.file("kv.db"));
