@@ -194,9 +194,31 @@ TEST(FeatureExtractionTest, DatesThatCannotBeBrokenDownAddNoHour) {
   ReliqaClassifierInput input;
   input.assetDetails = {asset(std::numeric_limits<time_t>::max(), -1)};
   FeatureMap features = extractFeatures(input);
+  if (sizeof(time_t) == 4) {
+    // Every 32-bit date has a calendar hour: 2038-01-19 03:14:07 UTC.
+    EXPECT_EQ(features.at(44), 3.0);
+    return;
+  }
   for (int32_t id = 42; id <= 47; ++id) EXPECT_EQ(features.at(id), -1.0) << id;
   EXPECT_EQ(features.at(35), 0.0);  // the creation date still counts
   EXPECT_TRUE(std::isfinite(features.at(73)));
+}
+
+// The app's dates are 64-bit. Where time_t has 32 bits they keep their low
+// 32 bits, and a modification date is unknown when those bits are -1.
+TEST(FeatureExtractionTest, AppDatesKeepTheLowBitsOfA32BitTimeT) {
+  const int64_t lowBitsAllSet = 0xFFFFFFFF;  // 2106-02-07 with 64 bits, -1 with 32
+  ReliqaClassifierInput input;
+  input.assetDetails = {asset(recordDateOf(0), recordDateOf(lowBitsAllSet))};
+  FeatureMap features = extractFeatures(input);
+  if (sizeof(time_t) == 4) {
+    EXPECT_EQ(features.at(71), 0.0);   // unknown
+    EXPECT_EQ(features.at(72), -1.0);  // -1 minus the creation date
+  } else {
+    EXPECT_EQ(features.at(71), 100.0);
+    EXPECT_EQ(features.at(72), 4294967295.0);
+  }
+  EXPECT_EQ(int64_t{recordDateOf(int64_t{1} << 32)}, sizeof(time_t) == 4 ? 0 : int64_t{1} << 32);
 }
 
 }  // namespace

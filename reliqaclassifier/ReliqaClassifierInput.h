@@ -45,8 +45,13 @@ struct OptionalImageMetricValue {
   double value = 0.0;
 };
 
+// A date as the app hands it over (a 64-bit count of seconds since the Unix
+// epoch) as the records hold it: a plain integral conversion, so where time_t
+// has 32 bits only the low 32 bits are kept and dates from 2038 on wrap.
+inline time_t recordDateOf(int64_t managedSeconds) { return static_cast<time_t>(managedSeconds); }
+
 // One photo or video of the collection. Dates are seconds since the Unix
-// epoch; a modification date of -1 means "unknown".
+// epoch (see recordDateOf); a modification date of -1 means "unknown".
 struct AssetDetail {
   std::string assetID;
   std::string assetType;

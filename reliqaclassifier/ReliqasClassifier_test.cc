@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cmath>
+#include <cstdlib>
 #include <limits>
 #include <set>
 #include <thread>
@@ -269,12 +270,15 @@ TEST(ReliqasClassifierPersistenceTest, ParametersSurviveANewClassifierAndANewPro
 
   // The helper checks what we left, then stores its own identifier, threshold
   // and server features.
+  // A cross build runs the helper, like this test, through its emulator.
   std::vector<std::string> args = {PROCESS_HELPER, path, "parent", firstScore, "child", "0.75"};
+  const char* emulator = std::getenv("RELIQA_EMULATOR");
+  if (emulator != nullptr && *emulator != '\0') args.insert(args.begin(), emulator);
   std::vector<char*> argv;
   for (std::string& arg : args) argv.push_back(arg.data());
   argv.push_back(nullptr);
   pid_t pid = 0;
-  ASSERT_EQ(posix_spawn(&pid, PROCESS_HELPER, nullptr, nullptr, argv.data(), environ), 0);
+  ASSERT_EQ(posix_spawn(&pid, argv[0], nullptr, nullptr, argv.data(), environ), 0);
   int status = 0;
   ASSERT_EQ(waitpid(pid, &status, 0), pid);
   ASSERT_TRUE(WIFEXITED(status));

@@ -51,5 +51,5 @@ find_program(RELIQA_DEBIAN_PYTHON /usr/bin/python3)
 if(RELIQA_DEBIAN_PYTHON AND EXISTS ${_reliqa_dir}/cli_test.py)
   add_test(NAME reliqa_cli_test
     COMMAND ${RELIQA_DEBIAN_PYTHON} ${_reliqa_dir}/cli_test.py $<TARGET_FILE:reliqa> ${PROJECT_SOURCE_DIR})
-  set_tests_properties(reliqa_cli_test PROPERTIES ENVIRONMENT "TZ=UTC" TIMEOUT 300)
+  set_tests_properties(reliqa_cli_test PROPERTIES ENVIRONMENT "${RELIQA_TEST_ENVIRONMENT}" TIMEOUT 300)
 endif()

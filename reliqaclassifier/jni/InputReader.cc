@@ -202,10 +202,8 @@ OptionalImageMetricValue readOptionalImageMetricValue(JNIEnv* env, jobject objec
 AssetDetail readAssetDetail(JNIEnv* env, jobject object, const ObjectPath& path) {
   const auto& f = AssetDetailFields::get();
   AssetDetail asset;
-  asset.creationDateSinceEpoch =
-      static_cast<time_t>(env->GetLongField(object, f.creationDateSinceEpoch));
-  asset.modificationDateSinceEpoch =
-      static_cast<time_t>(env->GetLongField(object, f.modificationDateSinceEpoch));
+  asset.creationDateSinceEpoch = recordDateOf(env->GetLongField(object, f.creationDateSinceEpoch));
+  asset.modificationDateSinceEpoch = recordDateOf(env->GetLongField(object, f.modificationDateSinceEpoch));
   LocalRef<jobject> blurriness =
       readObject(env, object, f.blurrinessMetric, path, "blurrinessMetric");
   LocalRef<jobject> darkness = readObject(env, object, f.darknessMetric, path, "darknessMetric");

@@ -3,6 +3,9 @@
 
     cli_test.py BUILD/bin/reliqa REPO_ROOT
 
+A cross build sets RELIQA_EMULATOR to the program that runs the tool on this
+machine; every run of the tool then goes through it.
+
 Covers the error paths (one test per kind of bad input: exit status 2, one
 "reliqa: FILE:LINE: ..." line, nothing on standard output, nothing stored),
 JSON Lines streaming, the guard that keeps a rejected model out of the store,
@@ -22,7 +25,7 @@ import sys
 import tempfile
 import unittest
 
-RELIQA = None
+RELIQA = None  # the command that runs the tool: [emulator] + [path]
 ROOT = None
 MAGIC = 314156
 
@@ -74,7 +77,7 @@ class Tool(unittest.TestCase):
         return p
 
     def run_tool(self, *args, stdin=None, store=True):
-        argv = [RELIQA] + (["--store", self.store] if store else []) + list(args)
+        argv = RELIQA + (["--store", self.store] if store else []) + list(args)
         return subprocess.run(argv, input=stdin, capture_output=True, text=True, env=self.env, timeout=60)
 
     def ok(self, *args, **kw):
@@ -220,7 +223,7 @@ class ModelGuard(Tool):
 
 class Streaming(Tool):
     def test_each_line_is_answered_before_the_next_arrives(self):
-        p = subprocess.Popen([RELIQA, "--store", self.store, "classify", "-"], stdin=subprocess.PIPE,
+        p = subprocess.Popen(RELIQA + ["--store", self.store, "classify", "-"], stdin=subprocess.PIPE,
                              stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, text=True, env=self.env)
         try:
             for i in range(3):
@@ -296,5 +299,6 @@ class Inspection(Tool):
 
 
 if __name__ == "__main__":
-    RELIQA, ROOT = sys.argv[1], sys.argv[2]
+    ROOT = sys.argv[2]
+    RELIQA = ([os.environ["RELIQA_EMULATOR"]] if os.environ.get("RELIQA_EMULATOR") else []) + [sys.argv[1]]
     unittest.main(argv=sys.argv[:1], verbosity=1)

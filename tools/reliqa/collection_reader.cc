@@ -55,8 +55,8 @@ rc::AssetDetail readAsset(JsonDoc& doc, value& v, const std::string& path) {
     switch (i) {
       case 0: a.assetID = doc.getString(x, p); break;
       case 1: a.assetType = doc.getString(x, p); break;
-      case 2: a.creationDateSinceEpoch = static_cast<time_t>(doc.getInt(x, p, kInt64Min, kInt64Max)); break;
-      case 3: a.modificationDateSinceEpoch = static_cast<time_t>(doc.getInt(x, p, kInt64Min, kInt64Max)); break;
+      case 2: a.creationDateSinceEpoch = rc::recordDateOf(doc.getInt(x, p, kInt64Min, kInt64Max)); break;
+      case 3: a.modificationDateSinceEpoch = rc::recordDateOf(doc.getInt(x, p, kInt64Min, kInt64Max)); break;
       case 4: a.pixelWidth = doc.getDouble(x, p); break;
       case 5: a.pixelHeight = doc.getDouble(x, p); break;
       case 6: a.latitude = doc.getDouble(x, p); break;

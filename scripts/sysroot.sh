@@ -1,0 +1,91 @@
+#!/usr/bin/env bash
+# Makes (once) a Debian sysroot for a target ABI and prints its path.
+#   scripts/sysroot.sh arm64|armhf
+# The sysroot holds the target's C library, C++ runtime, time zones and the
+# -dev packages the project builds against, unpacked by mmdebstrap from the
+# machine's own Debian sources (nothing is installed on this machine for
+# another architecture). It is cached under ~/.cache/reliqa/ and made anew
+# when the package list or the sources change.
+set -euo pipefail
+ABI=${1:?usage: $0 arm64|armhf}
+case "$ABI" in
+  arm64 | armhf) ;;
+  *) echo "sysroot: unknown ABI '$ABI' (arm64 or armhf)" >&2; exit 2 ;;
+esac
+
+PACKAGES=(
+  libc6-dev libstdc++-12-dev libgcc-12-dev tzdata
+  libgoogle-glog-dev libgflags-dev libdouble-conversion-dev libfmt-dev libsimdjson-dev libsqlite3-dev
+  libgtest-dev libgmock-dev libcli11-dev
+)
+
+# The machine's configured Debian sources as one-line entries.
+sources=$(mktemp)
+trap 'rm -f "$sources" "$sources.nosec"' EXIT
+{
+  for f in /etc/apt/sources.list /etc/apt/sources.list.d/*.list; do
+    [ -f "$f" ] && grep -hE '^[[:space:]]*deb[[:space:]]' "$f" || true
+  done
+  for f in /etc/apt/sources.list.d/*.sources; do
+    [ -f "$f" ] || continue
+    # deb822 stanzas: one line per (URI, suite) with the stanza's components.
+    awk 'function flush() { if (types ~ /(^| )deb( |$)/ && enabled != "no")
+                              for (i = 1; i <= nu; i++) for (j = 1; j <= ns; j++)
+                                print "deb" (key ? " [signed-by=" key "]" : "") " " u[i] " " s[j] " " comps
+                            types = ""; comps = ""; key = ""; enabled = ""; nu = 0; ns = 0 }
+         /^[[:space:]]*#/ { next }
+         /^[[:space:]]*$/ { flush(); next }
+         { field = tolower($1); sub(/:$/, "", field); $1 = "" ; sub(/^ /, "")
+           if (field == "types") types = $0
+           else if (field == "uris") nu = split($0, u, " ")
+           else if (field == "suites") ns = split($0, s, " ")
+           else if (field == "components") comps = $0
+           else if (field == "signed-by") key = $0
+           else if (field == "enabled") enabled = tolower($0) }
+         END { flush() }' "$f"
+  done
+} >"$sources"
+[ -s "$sources" ] || { echo "sysroot: no Debian sources configured in /etc/apt" >&2; exit 1; }
+
+key=$( { echo "$ABI"; printf '%s\n' "${PACKAGES[@]}"; cat "$sources"; } | sha256sum | cut -c1-12)
+CACHE=${XDG_CACHE_HOME:-$HOME/.cache}/reliqa
+ROOT=$CACHE/sysroot-$ABI-$key
+if [ -f "$ROOT/.complete" ]; then
+  echo "$ROOT"
+  exit 0
+fi
+
+mkdir -p "$CACHE"
+rm -rf "$ROOT" "$ROOT.tmp"
+include=$(IFS=,; echo "${PACKAGES[*]}")
+unpack() {  # unpack <sources file>
+  mmdebstrap --quiet --variant=extract --arch="$ABI" --include="$include" \
+    "$(. /etc/os-release && echo "$VERSION_CODENAME")" "$ROOT.tmp" "$1" >&2
+}
+echo "sysroot: unpacking $ABI packages into $ROOT" >&2
+if ! unpack "$sources"; then
+  # A mirror caught mid-sync serves an index that does not match its release
+  # file, which happens to the security suite's smaller architectures. Its
+  # fixes are folded into the next point release, so go on without it.
+  grep -v -- '-security' "$sources" >"$sources.nosec" || true
+  cmp -s "$sources" "$sources.nosec" && exit 1
+  echo "sysroot: retrying without the security suite" >&2
+  rm -rf "$ROOT.tmp"
+  unpack "$sources.nosec"
+fi
+# Some of the packages link their development files with absolute paths;
+# make them point inside the sysroot.
+find "$ROOT.tmp" -type l -lname '/*' | while read -r link; do
+  target=$(readlink "$link")
+  ln -sfn "$ROOT/${target#/}" "$link"
+done
+# and some CMake package files name their headers by absolute path.
+grep -rlZ 'INTERFACE_INCLUDE_DIRECTORIES "/usr/' "$ROOT.tmp/usr/lib" "$ROOT.tmp/usr/share" --include='*.cmake' |
+  xargs -0 -r sed -i "s|INTERFACE_INCLUDE_DIRECTORIES \"/usr/|INTERFACE_INCLUDE_DIRECTORIES \"$ROOT/usr/|"
+# Sysroots of this ABI made from an older package list are of no more use.
+for old in "$CACHE"/sysroot-"$ABI"-*; do
+  [ "$old" = "$ROOT.tmp" ] || rm -rf "$old"
+done
+touch "$ROOT.tmp/.complete"
+mv "$ROOT.tmp" "$ROOT"
+echo "$ROOT"
