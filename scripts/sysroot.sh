@@ -73,6 +73,18 @@ if ! unpack "$sources"; then
   rm -rf "$ROOT.tmp"
   unpack "$sources.nosec"
 fi
+# Merge /lib into /usr/lib as an installed Debian system has it: the target's
+# loader, run under qemu-user, then finds every library in its first
+# directory.
+if [ -d "$ROOT.tmp/lib" ] && [ ! -L "$ROOT.tmp/lib" ]; then
+  cp -a "$ROOT.tmp/lib/." "$ROOT.tmp/usr/lib/"
+  rm -rf "$ROOT.tmp/lib"
+  ln -s usr/lib "$ROOT.tmp/lib"
+fi
+# The build machine's loader cache describes its own libraries, and the
+# target's loader would read it: give the sysroot an empty one.
+mkdir -p "$ROOT.tmp/etc"
+: >"$ROOT.tmp/etc/ld.so.cache"
 # Some of the packages link their development files with absolute paths;
 # make them point inside the sysroot.
 find "$ROOT.tmp" -type l -lname '/*' | while read -r link; do

@@ -37,6 +37,15 @@ reliqa_test(reliqa_tool_models_test
   SOURCES ${_reliqa_dir}/xgboost_model_test.cc ${_reliqa_dir}/inspect_pdp_test.cc
   LIBS reliqa_tool_models)
 
+# Features and scores of a few hundred collections, bit for bit as a native
+# build computed them (golden_data.py writes the file): the same on every ABI.
+reliqa_test(reliqa_golden_test
+  SOURCES ${_reliqa_dir}/golden_test.cc
+  LIBS reliqa_tool_readers reliqa_features gbdt)
+target_compile_definitions(reliqa_golden_test PRIVATE
+  GOLDEN_COLLECTIONS="${_reliqa_dir}/testdata/golden_collections.jsonl"
+  GOLDEN_MODEL="${PROJECT_SOURCE_DIR}/examples/model.txt")
+
 if(NOT TARGET reliqa_classifier OR NOT TARGET keystash)
   message(STATUS "reliqa tool: waiting for the classifier (reliqa_classifier, keystash)")
   return()
