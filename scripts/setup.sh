@@ -6,7 +6,7 @@ set -euo pipefail
 PACKAGES=(
   build-essential cmake ninja-build pkg-config
   clang libclang-rt-14-dev lld tzdata
-  mmdebstrap qemu-user-static llvm-14
+  mmdebstrap qemu-user-static llvm-14 tcl
   libgoogle-glog-dev libdouble-conversion-dev libfmt-dev libsimdjson-dev libsqlite3-dev
   libgtest-dev libgmock-dev libbenchmark-dev libcli11-dev
   openjdk-17-jdk-headless junit5

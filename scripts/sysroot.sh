@@ -47,7 +47,7 @@ trap 'rm -f "$sources" "$sources.nosec"' EXIT
 } >"$sources"
 [ -s "$sources" ] || { echo "sysroot: no Debian sources configured in /etc/apt" >&2; exit 1; }
 
-key=$( { echo "$ABI"; printf '%s\n' "${PACKAGES[@]}"; cat "$sources"; } | sha256sum | cut -c1-12)
+key=$( { echo "$ABI"; printf '%s\n' "${PACKAGES[@]}"; cat "$sources" "$0"; } | sha256sum | cut -c1-12)
 CACHE=${XDG_CACHE_HOME:-$HOME/.cache}/reliqa
 ROOT=$CACHE/sysroot-$ABI-$key
 if [ -f "$ROOT/.complete" ]; then

@@ -4,7 +4,11 @@
 #   2. the same suite built with AddressSanitizer + UndefinedBehaviorSanitizer,
 #   3. the same suite built with ThreadSanitizer,
 #   4. each libFuzzer target for FUZZ_SECONDS (default 60) on its seed corpus,
-#   5. the JVM suite and the trainer cross-check, when they are present.
+#   5. the JVM suite and the trainer cross-check, when they are present,
+#   6. for arm64 and 32-bit ARM: a cross build, its GoogleTest suite and CLI
+#      tests under the emulator, and the example classified with the same
+#      output bytes as on this machine,
+#   7. the shippable libraries of every ABI, packaged and checked.
 # Any failure or sanitizer report makes it exit non-zero.
 set -euo pipefail
 cd "$(dirname "$0")/.."
@@ -65,4 +69,32 @@ if [ -x scripts/test-crosscheck.sh ]; then
   step "cross-check against the trainer"
   bash scripts/test-crosscheck.sh build
 fi
+# The example collection, classified by the reliqa of a build ($1) on a
+# fresh store; a cross build's runs through its emulator.
+classify_example() {
+  local build=$1 store run=()
+  store=$(mktemp -d)
+  [ -x "$build/emulator" ] && run=("$build/emulator")
+  "${run[@]}" "$build/bin/reliqa" --store "$store/store.db" set-model --model examples/model.txt \
+    --model-id example-synthetic-v1 --threshold 0.5 >/dev/null
+  TZ=UTC "${run[@]}" "$build/bin/reliqa" --store "$store/store.db" classify examples/collection.json
+  rm -rf "$store"
+}
+
+expected=$(classify_example build)
+for abi in arm64 armhf; do
+  step "$abi: cross build and tests under the emulator"
+  bash scripts/build-abi.sh "$abi"
+  ctest --test-dir "build-$abi" --output-on-failure -j "$JOBS"
+  if [ "$(classify_example "build-$abi")" != "$expected" ]; then
+    echo "test: build-$abi/bin/reliqa classifies the example differently from build/bin/reliqa" >&2
+    exit 1
+  fi
+  echo "the example classified by build-$abi/bin/reliqa: the same bytes as build/bin/reliqa"
+done
+
+step "shippable libraries"
+bash scripts/package.sh
+bash scripts/check-libs.sh
+
 step "all tests passed"
