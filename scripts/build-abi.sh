@@ -20,8 +20,7 @@ SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 BUILD=build-$ABI
 # A build configured against another sysroot keeps that sysroot's compiler
 # facts: start it afresh.
-if [ -f "$BUILD/CMakeCache.txt" ] && ! grep -qxF "RELIQA_SYSROOT:UNINITIALIZED=$SYSROOT" "$BUILD/CMakeCache.txt" &&
-   ! grep -qxF "RELIQA_SYSROOT:PATH=$SYSROOT" "$BUILD/CMakeCache.txt"; then
+if [ -f "$BUILD/CMakeCache.txt" ] && ! grep -qxF "RELIQA_SYSROOT:PATH=$SYSROOT" "$BUILD/CMakeCache.txt"; then
   rm -rf "$BUILD/CMakeCache.txt" "$BUILD/CMakeFiles"
 fi
 cmake -S . -B "$BUILD" -G Ninja -Wno-dev \

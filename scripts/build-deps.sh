@@ -57,13 +57,13 @@ version_of() {  # version_of <source package>
   for kv in "${versions[@]}"; do [ "${kv%%=*}" = "$1" ] && echo "${kv#*=}"; done
 }
 
-CACHE=${XDG_CACHE_HOME:-$HOME/.cache}/reliqa
+. scripts/cache-common.sh
 SYSROOT=""
 if [ "$ABI" != x86_64 ]; then
   SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 fi
 key=$( { echo "$ABI $SYSROOT"; printf '%s\n' "${versions[@]}"; echo "$CFLAGS_COMMON $LDFLAGS_COMMON";
-         cat "$0"; [ "$ABI" = x86_64 ] || cat "cmake/toolchains/$ABI.cmake" cmake/toolchains/cross-common.cmake; } |
+         cat scripts/build-deps.sh scripts/cache-common.sh; [ "$ABI" = x86_64 ] || cat "cmake/toolchains/$ABI.cmake" cmake/toolchains/cross-common.cmake; } |
        sha256sum | cut -c1-12)
 PREFIX=$CACHE/deps-$ABI-$key
 if [ -f "$PREFIX/.complete" ]; then
@@ -79,20 +79,9 @@ APTDIR=$SRCDIR/apt
 fetch_sources() {
   mkdir -p "$APTDIR/parts" "$APTDIR/lists/partial" "$APTDIR/cache/archives/partial" "$SRCDIR/dl"
   rm -f "$APTDIR"/parts/*
-  local f n=0
   # The machine's configured mirrors, turned into source entries.
-  for f in /etc/apt/sources.list.d/*.sources; do
-    [ -f "$f" ] || continue
-    n=$((n + 1))
-    sed -E 's/^[Tt]ypes:.*/Types: deb-src/' "$f" >"$APTDIR/parts/$n.sources"
-  done
-  for f in /etc/apt/sources.list /etc/apt/sources.list.d/*.list; do
-    [ -f "$f" ] || continue
-    n=$((n + 1))
-    { grep -hE '^[[:space:]]*deb[[:space:]]' "$f" || true; } |
-      sed -E 's/^[[:space:]]*deb[[:space:]]/deb-src /' >"$APTDIR/parts/$n.list"
-  done
-  [ "$n" -gt 0 ] || { echo "build-deps: no Debian sources configured in /etc/apt" >&2; exit 1; }
+  debian_sources | sed -E 's/^[[:space:]]*deb[[:space:]]/deb-src /' >"$APTDIR/parts/machine.list"
+  [ -s "$APTDIR/parts/machine.list" ] || { echo "build-deps: no Debian sources configured in /etc/apt" >&2; exit 1; }
   cat >"$APTDIR/apt.conf" <<EOF
 Dir::Etc::SourceList "/dev/null";
 Dir::Etc::SourceParts "$APTDIR/parts";
@@ -244,10 +233,4 @@ for entry in "${DEPS[@]}"; do
 done
 
 rm -rf "$BUILD"
-# Prefixes of this ABI made with other versions, flags or scripts are of no more use.
-for old in "$CACHE"/deps-"$ABI"-*; do
-  [ "$old" = "$PREFIX.tmp" ] || rm -rf "$old"
-done
-touch "$PREFIX.tmp/.complete"
-mv "$PREFIX.tmp" "$PREFIX"
-echo "$PREFIX"
+publish_cached "$PREFIX"

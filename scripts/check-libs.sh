@@ -38,13 +38,13 @@ fi
 
 # Loads <lib> with the libraries of its directory and prints what the loader
 # reports, the way ldd -r does.
+# $sysroot is the ABI's sysroot (none for x86_64).
 load_report() {  # load_report <ABI> <library>
-  local abi=$1 lib=$2 dir sysroot
+  local abi=$1 lib=$2 dir
   dir=$(dirname "$lib")
   case "$abi" in
     x86_64) LD_LIBRARY_PATH=$dir ldd -r "$lib" 2>&1 || true ;;
     arm64 | armhf)
-      sysroot=$(bash scripts/sysroot.sh "$abi")
       local qemu=qemu-aarch64-static loader=$sysroot/lib/ld-linux-aarch64.so.1
       if [ "$abi" = armhf ]; then qemu=qemu-arm-static loader=$sysroot/lib/ld-linux-armhf.so.3; fi
       LD_TRACE_LOADED_OBJECTS=1 LD_WARN=yes LD_BIND_NOW=yes \
@@ -62,6 +62,8 @@ for abi in "${abis[@]}"; do
     fail "$abi" "dist/$abi holds no library"
     continue
   fi
+  sysroot=""
+  [ "$abi" = x86_64 ] || sysroot=$(bash scripts/sysroot.sh "$abi")
   total=0
   for lib in "${libs[@]}"; do
     name=$(basename "$lib")

@@ -19,36 +19,16 @@ PACKAGES=(
   libgtest-dev libgmock-dev libcli11-dev
 )
 
-# The machine's configured Debian sources as one-line entries.
+cd "$(dirname "$0")/.."
+. scripts/cache-common.sh
+
 sources=$(mktemp)
 trap 'rm -f "$sources" "$sources.nosec"' EXIT
-{
-  for f in /etc/apt/sources.list /etc/apt/sources.list.d/*.list; do
-    [ -f "$f" ] && grep -hE '^[[:space:]]*deb[[:space:]]' "$f" || true
-  done
-  for f in /etc/apt/sources.list.d/*.sources; do
-    [ -f "$f" ] || continue
-    # deb822 stanzas: one line per (URI, suite) with the stanza's components.
-    awk 'function flush() { if (types ~ /(^| )deb( |$)/ && enabled != "no")
-                              for (i = 1; i <= nu; i++) for (j = 1; j <= ns; j++)
-                                print "deb" (key ? " [signed-by=" key "]" : "") " " u[i] " " s[j] " " comps
-                            types = ""; comps = ""; key = ""; enabled = ""; nu = 0; ns = 0 }
-         /^[[:space:]]*#/ { next }
-         /^[[:space:]]*$/ { flush(); next }
-         { field = tolower($1); sub(/:$/, "", field); $1 = "" ; sub(/^ /, "")
-           if (field == "types") types = $0
-           else if (field == "uris") nu = split($0, u, " ")
-           else if (field == "suites") ns = split($0, s, " ")
-           else if (field == "components") comps = $0
-           else if (field == "signed-by") key = $0
-           else if (field == "enabled") enabled = tolower($0) }
-         END { flush() }' "$f"
-  done
-} >"$sources"
+debian_sources >"$sources"
 [ -s "$sources" ] || { echo "sysroot: no Debian sources configured in /etc/apt" >&2; exit 1; }
 
-key=$( { echo "$ABI"; printf '%s\n' "${PACKAGES[@]}"; cat "$sources" "$0"; } | sha256sum | cut -c1-12)
-CACHE=${XDG_CACHE_HOME:-$HOME/.cache}/reliqa
+key=$( { echo "$ABI"; printf '%s\n' "${PACKAGES[@]}"; cat "$sources" scripts/sysroot.sh scripts/cache-common.sh; } |
+       sha256sum | cut -c1-12)
 ROOT=$CACHE/sysroot-$ABI-$key
 if [ -f "$ROOT/.complete" ]; then
   echo "$ROOT"
@@ -94,10 +74,4 @@ done
 # and some CMake package files name their headers by absolute path.
 grep -rlZ 'INTERFACE_INCLUDE_DIRECTORIES "/usr/' "$ROOT.tmp/usr/lib" "$ROOT.tmp/usr/share" --include='*.cmake' |
   xargs -0 -r sed -i "s|INTERFACE_INCLUDE_DIRECTORIES \"/usr/|INTERFACE_INCLUDE_DIRECTORIES \"$ROOT/usr/|"
-# Sysroots of this ABI made from an older package list are of no more use.
-for old in "$CACHE"/sysroot-"$ABI"-*; do
-  [ "$old" = "$ROOT.tmp" ] || rm -rf "$old"
-done
-touch "$ROOT.tmp/.complete"
-mv "$ROOT.tmp" "$ROOT"
-echo "$ROOT"
+publish_cached "$ROOT"
