@@ -1,156 +1,240 @@
+// Two readers for the schema in collection_schema.h:
+//  - QuickReader walks simdjson's DOM, which has validated the whole text
+//    (structure, strings, UTF-8, numbers, nothing after the root). It builds
+//    no text and allocates nothing per member; at the first thing it cannot
+//    vouch for it gives up.
+//  - CarefulReader walks the text with simdjson On-Demand through JsonDoc,
+//    which places every problem at its line and names it.
+// The quick one must never accept a text that the careful one refuses, nor
+// read a different value; fuzz_collection_json holds it to that.
 #include "tools/reliqa/collection_reader.h"
 
-#include <limits>
+#include <cstring>
+#include <vector>
 
+#include "tools/reliqa/collection_schema.h"
 #include "tools/reliqa/json_doc.h"
 
 namespace reliqa::tool {
 
 namespace rc = kestrova::reliqaclassifier;
-using simdjson::ondemand::array;
-using simdjson::ondemand::field;
-using simdjson::ondemand::object;
-using simdjson::ondemand::value;
 
 namespace {
 
-constexpr int64_t kInt32Min = std::numeric_limits<int32_t>::min();
-constexpr int64_t kInt32Max = std::numeric_limits<int32_t>::max();
-constexpr int64_t kInt64Min = std::numeric_limits<int64_t>::min();
-constexpr int64_t kInt64Max = std::numeric_limits<int64_t>::max();
+// Texts longer than this go straight to the careful reader: the DOM needs
+// several times the text's size.
+constexpr size_t kQuickLimit = size_t{16} << 20;
 
-// Calls `onMember(index, key, value)` for every member of `obj`, checked
-// against `members`, then requires that all were present.
-template <class F>
-void readObject(JsonDoc& doc, object obj, const char* at, MemberSet& members, F&& onMember) {
-  for (auto member : obj) {
-    field f = doc.take(std::move(member), "");
-    std::string_view key = doc.take(f.unescaped_key(), "");
-    value v = f.value();
-    size_t index = members.accept(doc, key, v);
-    onMember(index, members.pathOf(key), v);
+class QuickReader {
+ public:
+  using Value = simdjson::dom::element;
+  struct GiveUp {};
+
+  QuickReader(std::string_view text, Value root) : text_(text), root_(root) {}
+
+  template <class F>
+  void root(MemberNames names, F&& onMember) {
+    members(root_, MemberPath{}, names, onMember);
   }
-  members.requireAll(doc, at);
-}
 
-rc::OptionalImageMetricValue readMetric(JsonDoc& doc, value& v, const std::string& path) {
-  rc::OptionalImageMetricValue m;
-  const char* at = v.raw_json_token().data();
-  MemberSet members(path, {"isCalculated", "value"});
-  readObject(doc, doc.getObject(v, path), at, members, [&](size_t i, const std::string& p, value& x) {
-    if (i == 0) m.isCalculated = doc.getBool(x, p);
-    else m.value = doc.getDouble(x, p);
-  });
-  return m;
-}
-
-rc::AssetDetail readAsset(JsonDoc& doc, value& v, const std::string& path) {
-  rc::AssetDetail a;
-  const char* at = v.raw_json_token().data();
-  MemberSet members(path, {"assetID", "assetType", "creationDateSinceEpoch", "modificationDateSinceEpoch",
-                           "pixelWidth", "pixelHeight", "latitude", "longitude", "videoDuration",
-                           "isFavorite", "isHidden", "mediaSubtypes", "sourceType", "blurrinessMetric",
-                           "darknessMetric"});
-  readObject(doc, doc.getObject(v, path), at, members, [&](size_t i, const std::string& p, value& x) {
-    switch (i) {
-      case 0: a.assetID = doc.getString(x, p); break;
-      case 1: a.assetType = doc.getString(x, p); break;
-      case 2: a.creationDateSinceEpoch = rc::recordDateOf(doc.getInt(x, p, kInt64Min, kInt64Max)); break;
-      case 3: a.modificationDateSinceEpoch = rc::recordDateOf(doc.getInt(x, p, kInt64Min, kInt64Max)); break;
-      case 4: a.pixelWidth = doc.getDouble(x, p); break;
-      case 5: a.pixelHeight = doc.getDouble(x, p); break;
-      case 6: a.latitude = doc.getDouble(x, p); break;
-      case 7: a.longitude = doc.getDouble(x, p); break;
-      case 8: a.videoDuration = doc.getDouble(x, p); break;
-      case 9: a.isFavorite = static_cast<int32_t>(doc.getInt(x, p, kInt32Min, kInt32Max)); break;
-      case 10: a.isHidden = static_cast<int32_t>(doc.getInt(x, p, kInt32Min, kInt32Max)); break;
-      case 11: a.mediaSubtypes = static_cast<int32_t>(doc.getInt(x, p, kInt32Min, kInt32Max)); break;
-      case 12: a.sourceType = static_cast<int32_t>(doc.getInt(x, p, kInt32Min, kInt32Max)); break;
-      case 13: a.blurrinessMetric = readMetric(doc, x, p); break;
-      default: a.darknessMetric = readMetric(doc, x, p); break;
+  template <class F>
+  void members(Value& v, const MemberPath& path, MemberNames names, F&& onMember) {
+    simdjson::dom::object obj;
+    if (v.get_object().get(obj)) throw GiveUp{};
+    uint32_t seen = 0;
+    size_t next = 0;  // members usually come in the same order every time
+    for (simdjson::dom::key_value_pair field : obj) {
+      size_t i = indexOf(names, field.key, next);
+      if (i == names.size() || (seen >> i & 1) != 0) throw GiveUp{};
+      seen |= uint32_t{1} << i;
+      next = i + 1;
+      onMember(i, field.value, path.child(field.key));
     }
-  });
-  return a;
-}
-
-rc::DuplicateInfo readDuplicate(JsonDoc& doc, value& v, const std::string& path) {
-  rc::DuplicateInfo d;
-  const char* at = v.raw_json_token().data();
-  MemberSet members(path, {"assetIdA", "assetIdB", "dupeCoefficient"});
-  readObject(doc, doc.getObject(v, path), at, members, [&](size_t i, const std::string& p, value& x) {
-    if (i == 0) d.assetIdA = doc.getString(x, p);
-    else if (i == 1) d.assetIdB = doc.getString(x, p);
-    else d.dupeCoefficient = doc.getDouble(x, p);
-  });
-  return d;
-}
-
-rc::LocationInfo readLocation(JsonDoc& doc, value& v, const std::string& path) {
-  rc::LocationInfo l;
-  const char* at = v.raw_json_token().data();
-  MemberSet members(path, {"name", "isLandmark", "longitude", "latitude"});
-  readObject(doc, doc.getObject(v, path), at, members, [&](size_t i, const std::string& p, value& x) {
-    switch (i) {
-      case 0: l.name = doc.getString(x, p); break;
-      case 1: l.isLandmark = doc.getBool(x, p); break;
-      case 2: l.longitude = doc.getDouble(x, p); break;
-      default: l.latitude = doc.getDouble(x, p); break;
-    }
-  });
-  return l;
-}
-
-rc::AssetCounts readCounts(JsonDoc& doc, value& v, const std::string& path) {
-  rc::AssetCounts c;
-  const char* at = v.raw_json_token().data();
-  int32_t* fields[] = {&c.tileCount, &c.totalAssetsCount, &c.photosCount, &c.burstCount,
-                       &c.videosCount, &c.loopsCount, &c.totalAssetsWithinBurstsCount,
-                       &c.totalAssetsWithinLoopsCount, &c.facesCount, &c.photosWithFacesCount};
-  MemberSet members(path, {"tileCount", "totalAssetsCount", "photosCount", "burstCount", "videosCount",
-                           "loopsCount", "totalAssetsWithinBurstsCount", "totalAssetsWithinLoopsCount",
-                           "facesCount", "photosWithFacesCount"});
-  readObject(doc, doc.getObject(v, path), at, members, [&](size_t i, const std::string& p, value& x) {
-    *fields[i] = static_cast<int32_t>(doc.getInt(x, p, kInt32Min, kInt32Max));
-  });
-  return c;
-}
-
-template <class T, class ReadOne>
-std::vector<T> readList(JsonDoc& doc, value& v, const std::string& path, ReadOne&& readOne) {
-  std::vector<T> out;
-  size_t index = 0;
-  for (auto element : doc.getArray(v, path)) {
-    std::string p = path + "[" + std::to_string(index++) + "]";
-    value x = doc.take(std::move(element), p);
-    out.push_back(readOne(doc, x, p));
+    if (seen != (uint32_t{1} << names.size()) - 1) throw GiveUp{};
   }
-  return out;
-}
+
+  template <class F>
+  void elements(Value& v, const MemberPath& path, F&& onElement) {
+    simdjson::dom::array arr;
+    if (v.get_array().get(arr)) throw GiveUp{};
+    size_t i = 0;
+    for (Value x : arr) onElement(x, path.item(i++));
+  }
+
+  double number(Value& v, const MemberPath&) {
+    switch (v.type()) {
+      case simdjson::dom::element_type::DOUBLE: return v.get_double().value_unsafe();
+      case simdjson::dom::element_type::UINT64: return static_cast<double>(v.get_uint64().value_unsafe());
+      case simdjson::dom::element_type::INT64: {
+        // The DOM reads "-0" as the integer 0; the number is -0.0.
+        int64_t i = v.get_int64().value_unsafe();
+        if (i == 0 && mayHoldMinusZero()) throw GiveUp{};
+        return static_cast<double>(i);
+      }
+      default: throw GiveUp{};
+    }
+  }
+
+  int64_t integer(Value& v, const MemberPath&, int64_t min, int64_t max) {
+    if (v.type() != simdjson::dom::element_type::INT64) throw GiveUp{};
+    int64_t i = v.get_int64().value_unsafe();
+    if (i < min || i > max) throw GiveUp{};
+    return i;
+  }
+
+  bool boolean(Value& v, const MemberPath&) {
+    if (v.type() != simdjson::dom::element_type::BOOL) throw GiveUp{};
+    return v.get_bool().value_unsafe();
+  }
+
+  void string(Value& v, const MemberPath&, std::string& out) {
+    if (v.type() != simdjson::dom::element_type::STRING) throw GiveUp{};
+    std::string_view s = v.get_string().value_unsafe();
+    out.assign(s.data(), s.size());
+  }
+
+  bool null(Value& v, const MemberPath&) { return v.is_null(); }
+
+ private:
+  static size_t indexOf(MemberNames names, std::string_view key, size_t guess) {
+    if (guess < names.size() && names[guess] == key) return guess;
+    for (size_t i = 0; i < names.size(); ++i) {
+      if (names[i] == key) return i;
+    }
+    return names.size();
+  }
+
+  // Whether the text may hold the number -0: a "-0" after ':', ',' or '['
+  // and before ',', '}', ']' or white space. Conservative: such a sequence
+  // inside a string counts too.
+  bool mayHoldMinusZero() {
+    if (minusZero_ < 0) {
+      minusZero_ = 0;
+      auto space = [](char c) { return c == ' ' || c == '\n' || c == '\r' || c == '\t'; };
+      const char* begin = text_.data();
+      const char* end = begin + text_.size();
+      for (const char* p = begin; (p = static_cast<const char*>(std::memchr(p, '-', end - p))) != nullptr; ++p) {
+        if (end - p < 2 || p[1] != '0') continue;
+        const char* before = p;
+        while (before > begin && space(before[-1])) --before;
+        bool opens = before > begin && (before[-1] == ':' || before[-1] == ',' || before[-1] == '[');
+        char after = end - p > 2 ? p[2] : ' ';
+        bool closes = after == ',' || after == '}' || after == ']' || space(after);
+        if (opens && closes) {
+          minusZero_ = 1;
+          break;
+        }
+      }
+    }
+    return minusZero_ == 1;
+  }
+
+  std::string_view text_;
+  Value root_;
+  int minusZero_ = -1;  // unknown until needed
+};
+
+class CarefulReader {
+ public:
+  using Value = simdjson::ondemand::value;
+
+  explicit CarefulReader(JsonDoc& doc) : doc_(doc) {}
+
+  template <class F>
+  void root(MemberNames names, F&& onMember) {
+    eachMember(doc_.rootObject("a collection"), nullptr, MemberPath{}, names, onMember);
+    doc_.expectEnd();
+  }
+
+  template <class F>
+  void members(Value& v, const MemberPath& path, MemberNames names, F&& onMember) {
+    const char* at = v.raw_json_token().data();
+    eachMember(doc_.getObject(v, path.text()), at, path, names, onMember);
+  }
+
+  template <class F>
+  void elements(Value& v, const MemberPath& path, F&& onElement) {
+    size_t index = 0;
+    for (auto element : doc_.getArray(v, path.text())) {
+      MemberPath p = path.item(index++);
+      Value x = doc_.take(std::move(element), p.text());
+      onElement(x, p);
+    }
+  }
+
+  double number(Value& v, const MemberPath& p) { return doc_.getDouble(v, p.text()); }
+  int64_t integer(Value& v, const MemberPath& p, int64_t min, int64_t max) {
+    return doc_.getInt(v, p.text(), min, max);
+  }
+  bool boolean(Value& v, const MemberPath& p) { return doc_.getBool(v, p.text()); }
+  void string(Value& v, const MemberPath& p, std::string& out) { out = doc_.getString(v, p.text()); }
+  bool null(Value& v, const MemberPath& p) { return doc_.isNull(v, p.text()); }
+
+ private:
+  // Every member once, each one known, all of them present; `at` places the
+  // message about a missing one.
+  template <class F>
+  void eachMember(simdjson::ondemand::object obj, const char* at, const MemberPath& path, MemberNames names,
+                  F&& onMember) {
+    std::vector<bool> seen(names.size(), false);
+    for (auto member : obj) {
+      simdjson::ondemand::field f = doc_.take(std::move(member), "");
+      std::string_view key = doc_.take(f.unescaped_key(), "");
+      Value v = f.value();
+      MemberPath p = path.child(key);
+      size_t i = 0;
+      while (i < names.size() && names[i] != key) ++i;
+      if (i == names.size()) {
+        std::string in = path.parent == nullptr ? std::string() : " in " + path.text();
+        std::string known;
+        for (std::string_view n : names) (known += known.empty() ? "" : ", ").append(n);
+        doc_.fail(v, "unknown member " + quoteForMessage(key) + in + " (expected: " + known + ")");
+      }
+      if (seen[i]) doc_.fail(v, "member " + p.text() + " appears twice");
+      seen[i] = true;
+      onMember(i, v, p);
+    }
+    for (size_t i = 0; i < names.size(); ++i) {
+      if (!seen[i]) doc_.fail(at, "missing member " + path.child(names[i]).text());
+    }
+  }
+
+  JsonDoc& doc_;
+};
 
 }  // namespace
 
-rc::ReliqaClassifierInput parseCollection(std::string_view json, const std::string& name, int64_t firstLine) {
+bool CollectionReader::readQuickly(std::string_view json, rc::ReliqaClassifierInput& out) {
+  if (json.size() > kQuickLimit) return false;
+  padded_.resize(json.size() + simdjson::SIMDJSON_PADDING);
+  std::memcpy(padded_.data(), json.data(), json.size());
+  simdjson::dom::element root;
+  if (parser_.parse(padded_.data(), json.size(), false).get(root)) return false;
+  try {
+    QuickReader reader(json, root);
+    readCollectionWith(reader, out);
+  } catch (const QuickReader::GiveUp&) {
+    return false;
+  }
+  return true;
+}
+
+void CollectionReader::readCarefully(std::string_view json, const std::string& name, int64_t firstLine,
+                                     rc::ReliqaClassifierInput& out) {
   JsonDoc doc(json, name, firstLine);
-  rc::ReliqaClassifierInput in;
-  object root = doc.rootObject("a collection");
-  MemberSet members("", {"collectionID", "timeSinceStory", "locationInfo", "assetCounts", "assetDetails",
-                         "duplicateInfos"});
-  readObject(doc, root, nullptr, members, [&](size_t i, const std::string& p, value& x) {
-    switch (i) {
-      case 0: in.collectionID = doc.getString(x, p); break;
-      case 1: in.timeSinceStory = doc.getDouble(x, p); break;
-      case 2:
-        if (!doc.isNull(x, p)) in.locationInfo = readLocation(doc, x, p);
-        break;
-      case 3:
-        if (!doc.isNull(x, p)) in.assetCounts = readCounts(doc, x, p);
-        break;
-      case 4: in.assetDetails = readList<rc::AssetDetail>(doc, x, p, readAsset); break;
-      default: in.duplicateInfos = readList<rc::DuplicateInfo>(doc, x, p, readDuplicate); break;
-    }
-  });
-  doc.expectEnd();
-  return in;
+  CarefulReader reader(doc);
+  readCollectionWith(reader, out);
+}
+
+void CollectionReader::read(std::string_view json, const std::string& name, int64_t firstLine,
+                            rc::ReliqaClassifierInput& out) {
+  if (!readQuickly(json, out)) readCarefully(json, name, firstLine, out);
+}
+
+rc::ReliqaClassifierInput parseCollection(std::string_view json, const std::string& name, int64_t firstLine) {
+  rc::ReliqaClassifierInput out;
+  CollectionReader().read(json, name, firstLine, out);
+  return out;
 }
 
 }  // namespace reliqa::tool

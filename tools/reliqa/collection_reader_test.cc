@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include "tools/reliqa/errors.h"
+#include "tools/reliqa/testing/record_difference.h"
 
 namespace reliqa::tool {
 namespace {
@@ -113,6 +114,68 @@ TEST(CollectionReader, MalformedJsonIsAnErrorWithAPosition) {
   EXPECT_THAT(errorOf("{\"collectionID\": [}"), HasSubstr("f.json:1: unexpected '}'"));
   EXPECT_THAT(errorOf("{\"collectionID\": \"\xff\"}"), HasSubstr("UTF-8"));
   EXPECT_THAT(errorOf(std::string(5000, '[') + std::string(5000, ']')), HasSubstr("f.json:1: "));
+}
+
+// The quick pass vouches for a text only when it reads exactly what the
+// careful pass reads; numbers are compared by their bits.
+TEST(CollectionReader, BothPassesReadTheSameBits) {
+  auto with = [](const std::string& from, const std::string& to) {
+    std::string c = collection(kAsset);
+    return c.replace(c.find(from), from.size(), to);
+  };
+  const std::string texts[] = {
+      collection(kAsset),
+      with("\"latitude\": 38.7", "\"latitude\": -0"),           // the DOM reads -0 as the integer 0
+      with("\"videoDuration\": 0", "\"videoDuration\": -0 "),
+      with("\"videoDuration\": 0", "\"videoDuration\": -0.0"),
+      with("\"collectionID\": \"c\"", "\"collectionID\": \"c-0\""),  // -0 in a string only
+      with("\"pixelWidth\": 4032", "\"pixelWidth\": 18446744073709551615"),
+      with("\"pixelWidth\": 4032", "\"pixelWidth\": 1E2"),
+      with("\"pixelWidth\": 4032", "\"pixelWidth\": 123456789012345678901234567890"),
+      with("\"longitude\": -9.1", "\"longitude\": 2.2250738585072011e-308"),
+      with("\"creationDateSinceEpoch\": 4102444800", "\"creationDateSinceEpoch\": -0"),
+      with("\"assetID\": \"a1\"", "\"assetID\": \"\\u00e9\\n\\\"\""),
+  };
+  CollectionReader reader;
+  for (const std::string& text : texts) {
+    kestrova::reliqaclassifier::ReliqaClassifierInput quick, careful;
+    CollectionReader::readCarefully(text, "f.json", 1, careful);
+    if (reader.readQuickly(text, quick)) {
+      EXPECT_EQ(testing::recordDifference(quick, careful), "") << text;
+    }
+    kestrova::reliqaclassifier::ReliqaClassifierInput read;
+    reader.read(text, "f.json", 1, read);
+    EXPECT_EQ(testing::recordDifference(read, careful), "") << text;
+  }
+  // The quick pass does its work on ordinary text.
+  kestrova::reliqaclassifier::ReliqaClassifierInput out;
+  EXPECT_TRUE(reader.readQuickly(texts[0], out));
+  EXPECT_TRUE(reader.readQuickly(texts[4], out));
+}
+
+TEST(CollectionReader, AReusedRecordKeepsNothingOfTheCollectionBefore) {
+  CollectionReader reader;
+  kestrova::reliqaclassifier::ReliqaClassifierInput reused;
+  std::string big = collection(std::string(kAsset) + "," + kAsset + "," + kAsset,
+                               R"({"name": "Sintra", "isLandmark": true, "longitude": 1, "latitude": 2})",
+                               R"({"tileCount": 1, "totalAssetsCount": 2, "photosCount": 3, "burstCount": 4,
+      "videosCount": 5, "loopsCount": 6, "totalAssetsWithinBurstsCount": 7, "totalAssetsWithinLoopsCount": 8,
+      "facesCount": 9, "photosWithFacesCount": 10})");
+  std::string small = collection(R"({"assetID": "b", "assetType": "video",
+ "creationDateSinceEpoch": 1, "modificationDateSinceEpoch": 2, "pixelWidth": 3, "pixelHeight": 4,
+ "latitude": 5, "longitude": 6, "videoDuration": 7, "isFavorite": 0, "isHidden": 1, "mediaSubtypes": 0,
+ "sourceType": 0, "blurrinessMetric": {"isCalculated": false, "value": 0},
+ "darknessMetric": {"isCalculated": true, "value": 1}})");
+  reader.read(big, "f.json", 1, reused);
+  ASSERT_EQ(reused.assetDetails.size(), 3u);
+  reader.read(small, "f.json", 2, reused);
+  EXPECT_EQ(testing::recordDifference(reused, parseCollection(small, "f.json")), "");
+  EXPECT_FALSE(reused.locationInfo.has_value());
+  EXPECT_EQ(reused.assetCounts.facesCount, 0);
+  // After a refused text the next one still reads whole.
+  EXPECT_THROW(reader.read("{\"collectionID\": 1}", "f.json", 3, reused), ToolError);
+  reader.read(big, "f.json", 4, reused);
+  EXPECT_EQ(testing::recordDifference(reused, parseCollection(big, "f.json")), "");
 }
 
 }  // namespace

@@ -221,31 +221,4 @@ bool JsonDoc::isNull(simdjson::ondemand::value& v, const std::string& path) {
   return true;
 }
 
-MemberSet::MemberSet(std::string path, std::initializer_list<const char*> names)
-    : path_(std::move(path)), names_(names), seen_(names.size(), false) {}
-
-std::string MemberSet::pathOf(std::string_view key) const {
-  return path_.empty() ? std::string(key) : path_ + "." + std::string(key);
-}
-
-size_t MemberSet::accept(JsonDoc& doc, std::string_view key, simdjson::ondemand::value& v) {
-  for (size_t i = 0; i < names_.size(); ++i) {
-    if (key == names_[i]) {
-      if (seen_[i]) doc.fail(v, "member " + pathOf(key) + " appears twice");
-      seen_[i] = true;
-      return i;
-    }
-  }
-  std::string in = path_.empty() ? std::string() : " in " + path_;
-  std::string known;
-  for (const char* n : names_) known += std::string(known.empty() ? "" : ", ") + n;
-  doc.fail(v, "unknown member " + quoteForMessage(key) + in + " (expected: " + known + ")");
-}
-
-void MemberSet::requireAll(JsonDoc& doc, const char* at) const {
-  for (size_t i = 0; i < names_.size(); ++i) {
-    if (!seen_[i]) doc.fail(at, "missing member " + pathOf(names_[i]));
-  }
-}
-
 }  // namespace reliqa::tool

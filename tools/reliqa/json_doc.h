@@ -4,8 +4,7 @@
 // stream) and turns every problem into a ToolError that names the file and the
 // line of the offending byte. The typed getters check the JSON type of a value
 // and say what was expected, using a dotted path ("assetDetails[3].pixelWidth")
-// to name the value. MemberSet walks an object, refuses unknown and repeated
-// members and reports missing ones.
+// to name the value.
 //
 // A JsonDoc owns its padded copy of the text; values obtained from it are valid
 // while it lives. Not thread-safe; use one per thread.
@@ -14,10 +13,8 @@
 #include <simdjson.h>
 
 #include <cstdint>
-#include <initializer_list>
 #include <string>
 #include <string_view>
-#include <vector>
 
 namespace reliqa::tool {
 
@@ -76,23 +73,6 @@ class JsonDoc {
   simdjson::ondemand::parser parser_;
   simdjson::ondemand::document doc_;
   bool iterated_ = false;
-};
-
-// Tracks the members of one JSON object: which are allowed, which were seen.
-class MemberSet {
- public:
-  MemberSet(std::string path, std::initializer_list<const char*> names);
-  // Index of `key` among the names; throws ToolError (at `v`) for an unknown
-  // or repeated member.
-  size_t accept(JsonDoc& doc, std::string_view key, simdjson::ondemand::value& v);
-  // Throws ToolError (at `at`) naming the first member that was not seen.
-  void requireAll(JsonDoc& doc, const char* at) const;
-  std::string pathOf(std::string_view key) const;
-
- private:
-  std::string path_;
-  std::vector<const char*> names_;
-  std::vector<bool> seen_;
 };
 
 // Quotes a key for messages: "abc" (control bytes escaped, long keys cut).
