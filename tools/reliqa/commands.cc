@@ -81,34 +81,52 @@ std::unique_ptr<thornvale::BoostingModel> loadModel(const std::string& name, con
   }
 }
 
-// Calls `onDocument(text, firstLine)` for the input: the whole file for a
-// path, each non-blank line for standard input (JSON Lines).
+// Calls `onDocument(text, name, firstLine)` for the input: the whole file for
+// a path, each non-blank line for standard input (JSON Lines).
 template <class F>
 void forEachDocument(const std::string& input, ResultWriter& out, F&& onDocument) {
   if (input != "-") {
-    onDocument(readFile(input), displayName(input), int64_t{1});
+    onDocument(std::string_view(readFile(input)), displayName(input), int64_t{1});
     return;
   }
   LineReader lines(input, &out);
   std::string line;
   while (lines.next(line)) {
     if (line.find_first_not_of(" \t") == std::string::npos) continue;
-    onDocument(line, lines.name(), lines.lineNumber());
+    onDocument(std::string_view(line), lines.name(), lines.lineNumber());
   }
 }
 
-std::string resultJson(const rc::ReliqaClassifierResult& r) {
-  std::string s = "{\"score\":" + thornvale::doubleToJson(r.score) +
-                  ",\"isOverThreshold\":" + (r.isOverThreshold ? "true" : "false") + ",\"loggingData\":{";
+// Calls `onCollection(collection, name, line)` for every collection of the
+// input, read into one reused record.
+template <class F>
+void forEachCollection(const std::string& input, ResultWriter& out, F&& onCollection) {
+  CollectionReader reader;
+  rc::ReliqaClassifierInput collection;
+  forEachDocument(input, out, [&](std::string_view text, const std::string& name, int64_t line) {
+    reader.read(text, name, line, collection);
+    onCollection(collection, name, line);
+  });
+}
+
+// {"score":S,"isOverThreshold":B,"loggingData":{...}} into `s`.
+void writeResultJson(const rc::ReliqaClassifierResult& r, std::string& s) {
+  s.assign("{\"score\":");
+  s += thornvale::doubleToJson(r.score);
+  s += ",\"isOverThreshold\":";
+  s += r.isOverThreshold ? "true" : "false";
+  s += ",\"loggingData\":{";
   bool first = true;
   for (const char* key : {"score", "model_id", "feature_vector", "threshold"}) {
     auto it = r.loggingData.find(key);
     if (it == r.loggingData.end()) continue;
     if (!first) s += ',';
     first = false;
-    s += jsonString(key) + ":" + jsonString(it->second);
+    appendJsonString(s, key);
+    s += ':';
+    appendJsonString(s, it->second);
   }
-  return s + "}}";
+  s += "}}";
 }
 
 }  // namespace
@@ -195,11 +213,11 @@ void printModelId(const std::string& store, ResultWriter& out) {
 
 void classify(const std::string& store, const std::string& input, ResultWriter& out) {
   auto classifier = openClassifier(store);
-  forEachDocument(input, out, [&](const std::string& text, const std::string& name, int64_t line) {
-    rc::ReliqaClassifierInput collection = parseCollection(text, name, line);
-    std::string json;
+  std::string json;
+  forEachCollection(input, out, [&](const rc::ReliqaClassifierInput& collection, const std::string& name,
+                                    int64_t line) {
     try {
-      json = resultJson(classifier->classify(collection));
+      writeResultJson(classifier->classify(collection), json);
     } catch (const std::exception& e) {
       throw ToolError(name, line, std::string("classification failed: ") + e.what());
     }
@@ -208,8 +226,8 @@ void classify(const std::string& store, const std::string& input, ResultWriter& 
 }
 
 void features(const std::string& input, ResultWriter& out) {
-  forEachDocument(input, out, [&](const std::string& text, const std::string& name, int64_t line) {
-    rc::ReliqaClassifierInput collection = parseCollection(text, name, line);
+  forEachCollection(input, out, [&](const rc::ReliqaClassifierInput& collection, const std::string& name,
+                                    int64_t line) {
     std::string json;
     try {
       json = thornvale::featureMapToJson(rc::extractFeatures(collection));

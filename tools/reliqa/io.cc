@@ -132,12 +132,20 @@ bool LineReader::next(std::string& line) {
 }
 
 std::string jsonString(std::string_view s) {
-  static const char* hex = "0123456789abcdef";
   std::string out;
-  out.reserve(s.size() + 2);
+  appendJsonString(out, s);
+  return out;
+}
+
+void appendJsonString(std::string& out, std::string_view s) {
+  static const char* hex = "0123456789abcdef";
   out += '"';
-  for (char ch : s) {
-    unsigned char c = static_cast<unsigned char>(ch);
+  size_t plain = 0;  // start of the run of bytes copied as they are
+  for (size_t i = 0; i < s.size(); ++i) {
+    unsigned char c = static_cast<unsigned char>(s[i]);
+    if (c >= 0x20 && c != '"' && c != '\\') continue;
+    out.append(s.data() + plain, i - plain);
+    plain = i + 1;
     switch (c) {
       case '"': out += "\\\""; break;
       case '\\': out += "\\\\"; break;
@@ -147,17 +155,13 @@ std::string jsonString(std::string_view s) {
       case '\r': out += "\\r"; break;
       case '\t': out += "\\t"; break;
       default:
-        if (c < 0x20) {
-          out += "\\u00";
-          out += hex[c >> 4];
-          out += hex[c & 15];
-        } else {
-          out += ch;
-        }
+        out += "\\u00";
+        out += hex[c >> 4];
+        out += hex[c & 15];
     }
   }
+  out.append(s.data() + plain, s.size() - plain);
   out += '"';
-  return out;
 }
 
 }  // namespace reliqa::tool

@@ -76,5 +76,7 @@ class LineReader {
 // \r \t for those bytes, \u00XX for other bytes below 0x20; every other byte is
 // copied as it is.
 std::string jsonString(std::string_view s);
+// The same literal, appended to `out`.
+void appendJsonString(std::string& out, std::string_view s);
 
 }  // namespace reliqa::tool
