@@ -1,6 +1,7 @@
 # The `reliqa` command-line tool (build/bin/reliqa) and its tests.
 #
-# reliqa_tool_readers: JSON readers and I/O (records + simdjson only).
+# reliqa_tool_readers: JSON readers and I/O (records, server-feature texts and
+#                      the store's JSON encoding, simdjson).
 # reliqa_tool_models:  XGBoost conversion, model inspection, partial dependence
 #                      (needs the engine).
 # reliqa:              the tool (needs the classifier and the store as well).
@@ -15,7 +16,7 @@ add_library(reliqa_tool_readers STATIC
   ${_reliqa_dir}/json_doc.cc
 )
 target_include_directories(reliqa_tool_readers PUBLIC ${PROJECT_SOURCE_DIR})
-target_link_libraries(reliqa_tool_readers PUBLIC simdjson::simdjson glog::glog)
+target_link_libraries(reliqa_tool_readers PUBLIC reliqa_features reliqa_json simdjson::simdjson glog::glog)
 
 reliqa_test(reliqa_tool_readers_test
   SOURCES ${_reliqa_dir}/collection_reader_test.cc ${_reliqa_dir}/feature_rows_test.cc

@@ -11,7 +11,7 @@
 #include "host/jni/Strings.h"
 #include "reliqaclassifier/jni/ManagedClasses.h"
 #include "reliqaclassifier/jni/NullChecks.h"
-#include "reliqaclassifier/jni/ServerFeatureText.h"
+#include "reliqaclassifier/ServerFeatureText.h"
 
 namespace kestrova::reliqaclassifier {
 namespace {

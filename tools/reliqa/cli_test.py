@@ -216,9 +216,16 @@ class ModelGuard(Tool):
         self.ok("set-server-features", self.path("sf.json", {"1": "9.5", "01": "7", "300": 2}))
         fv = json.loads(self.classify(collection())["loggingData"]["feature_vector"])
         self.assertEqual((fv["1"], fv["300"]), (9.5, 2))
+        before = self.classify(collection())
         self.refused("set-server-features", self.path("nan.json", {"2": "nan"}), pattern=r"reads as NaN")
-        fv = json.loads(self.classify(collection())["loggingData"]["feature_vector"])
-        self.assertEqual(fv["300"], 2)
+        # Values the store would keep but never give back: every later classify would fail.
+        for key, value in [("12", "1152921504606846976"), ("3", "9223372036854775808"),
+                           ("3", "-9223372036854775809")]:
+            with self.subTest(value=value):
+                self.refused("set-server-features", self.path("big.json", {key: value}),
+                             pattern=r'big\.json:2: feature "%s": value "%s" cannot be stored: it would not read back \(.+\)$'
+                             % (key, value))
+                self.assertEqual(self.classify(collection()), before)
 
 
 class Streaming(Tool):

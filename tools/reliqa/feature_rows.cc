@@ -2,12 +2,15 @@
 
 #include <glog/logging.h>
 
-#include <cctype>
 #include <cmath>
-#include <cstdlib>
 #include <limits>
+#include <optional>
 
+#include "reliqaclassifier/ServerFeatureText.h"
 #include "tools/reliqa/json_doc.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FeatureMapJson.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
 namespace reliqa::tool {
 
@@ -37,6 +40,24 @@ std::optional<int32_t> strictId(std::string_view key) {
   return static_cast<int32_t>(v);
 }
 
+// Why the store would not give `x` back as the same number, or nothing when
+// it would: the value goes through the store's own encoder and decoder.
+std::optional<std::string> whyNotStorable(int32_t id, double x) {
+  std::string stored;
+  try {
+    stored = thornvale::featureMapToJson(FeatureMap{{id, x}});
+  } catch (const std::exception&) {
+    return std::string("reads as ") + (std::isnan(x) ? "NaN" : "infinity") + ", which the store cannot hold";
+  }
+  try {
+    double back = thornvale::featureMapFromJson(stored).at(id);
+    if (back == x) return std::nullopt;  // -0 comes back as 0, which compares equal everywhere
+    return "cannot be stored: it would read back as " + thornvale::doubleToText(back);
+  } catch (const std::exception& e) {
+    return std::string("cannot be stored: it would not read back (") + e.what() + ")";
+  }
+}
+
 }  // namespace
 
 FeatureMap parseFeatureRow(std::string_view json, const std::string& name, int64_t firstLine) {
@@ -54,23 +75,6 @@ FeatureMap parseFeatureRow(std::string_view json, const std::string& name, int64
   doc.expectEnd();
   return out;
 }
-
-std::optional<int32_t> serverFeatureId(const std::string& key) {
-  const char* p = key.c_str();
-  while (std::isspace(static_cast<unsigned char>(*p))) ++p;
-  bool negative = false;
-  if (*p == '+' || *p == '-') negative = *p++ == '-';
-  int64_t v = 0;
-  for (; *p >= '0' && *p <= '9'; ++p) {
-    v = v * 10 + (*p - '0');
-    if (v > int64_t{1} << 32) return std::nullopt;  // far outside; stop before overflowing
-  }
-  if (negative) v = -v;
-  if (v < std::numeric_limits<int32_t>::min() || v > std::numeric_limits<int32_t>::max()) return std::nullopt;
-  return static_cast<int32_t>(v);
-}
-
-double serverFeatureValue(const std::string& text) { return std::strtod(text.c_str(), nullptr); }
 
 FeatureMap parseServerFeatures(std::string_view json, const std::string& name) {
   JsonDoc doc(json, name);
@@ -91,16 +95,15 @@ FeatureMap parseServerFeatures(std::string_view json, const std::string& name) {
     } else {
       doc.fail(v, path + ": expected a number text (\"0.5\") or a number, got " + doc.typeName(v, path));
     }
-    std::optional<int32_t> id = serverFeatureId(key);
+    std::optional<int32_t> id = kestrova::reliqaclassifier::parseFeatureId(key);
     if (!id) {
       LOG(WARNING) << "server feature key " << quoteForMessage(key)
                    << " lies outside the 32-bit feature ids; dropped";
       continue;
     }
-    double x = serverFeatureValue(text);
-    if (!std::isfinite(x)) {
-      doc.fail(v, path + ": value " + quoteForMessage(text) + " reads as " + (std::isnan(x) ? "NaN" : "infinity") +
-                      ", which the store cannot hold");
+    double x = kestrova::reliqaclassifier::parseFeatureValue(text);
+    if (std::optional<std::string> why = whyNotStorable(*id, x)) {
+      doc.fail(v, path + ": value " + quoteForMessage(text) + " " + *why);
     }
     out.emplace(*id, x);  // the first key for an id wins
   }

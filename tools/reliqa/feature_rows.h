@@ -4,19 +4,21 @@
 //  - feature rows (`reliqa score`, `reliqa pdp --features`): keys are decimal
 //    32-bit ids ("17", "-3"), values JSON numbers; anything else is refused.
 //  - server features (`reliqa set-server-features`): the managed map of
-//    feature-id text to number text ({"12": "0.5"}), converted as the managed
-//    path converts it: keys by the C `atoi` rules (leading white space, optional
-//    sign, the digit run; no digits gives 0), values by C `strtod` (longest
-//    valid prefix; none gives 0.0). A JSON number is taken by its text. A key
-//    whose digit run lies outside the signed 32-bit range is dropped with a
-//    warning naming it; of several keys that read as one id, the first in the
-//    document wins. Values that read as NaN or infinity are refused, since the
-//    store cannot hold them.
+//    feature-id text to number text ({"12": "0.5"}), read by the classifier's
+//    own reader of those texts (ServerFeatureText.h), exactly as the app's map
+//    is read: keys by the C `atoi` rules, values by C `strtod` in the "C"
+//    locale. A JSON number is taken by its text. A key whose digit run lies
+//    outside the signed 32-bit range is dropped with a warning naming it; of
+//    several keys that read as one id, the first in the document wins.
+//    Every value is put through the store's own encoder and decoder, and one
+//    that would not come back as the same number is refused: NaN and the
+//    infinities cannot be stored at all, and an integral value stored as a
+//    text that its decoder cannot read exactly (2^60, 2^63) would make every
+//    later fetch of the server features fail.
 // Errors are ToolErrors naming the file and line.
 #pragma once
 
 #include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 
@@ -27,12 +29,5 @@ namespace reliqa::tool {
 thornvale::FeatureMap parseFeatureRow(std::string_view json, const std::string& name, int64_t firstLine = 1);
 
 thornvale::FeatureMap parseServerFeatures(std::string_view json, const std::string& name);
-
-// The C `atoi` reading of a key, or nothing when its value does not fit in 32
-// bits (where `atoi` itself is undefined).
-std::optional<int32_t> serverFeatureId(const std::string& key);
-
-// The C `strtod` reading of a value text.
-double serverFeatureValue(const std::string& text);
 
 }  // namespace reliqa::tool

@@ -37,18 +37,16 @@ TEST(FeatureRows, RefusesWhatIsNotAnIdToNumberMap) {
   EXPECT_THAT(errorOf([] { parseFeatureRow(R"({"3":null})", "rows"); }), HasSubstr("got null"));
 }
 
-TEST(ServerFeatures, KeysFollowTheCRules) {
-  EXPECT_EQ(serverFeatureId("12"), 12);
-  EXPECT_EQ(serverFeatureId("  7x"), 7);
-  EXPECT_EQ(serverFeatureId("+3"), 3);
-  EXPECT_EQ(serverFeatureId("-5"), -5);
-  EXPECT_EQ(serverFeatureId("abc"), 0);
-  EXPECT_EQ(serverFeatureId(""), 0);
-  EXPECT_EQ(serverFeatureId("000000000007"), 7);  // leading zeros do not count
-  EXPECT_EQ(serverFeatureId("2147483647"), 2147483647);
-  EXPECT_EQ(serverFeatureId("-2147483648"), -2147483647 - 1);
-  EXPECT_EQ(serverFeatureId("2147483648"), std::nullopt);
-  EXPECT_EQ(serverFeatureId("99999999999999999999999"), std::nullopt);
+TEST(ServerFeatures, KeysAndValuesReadAsTheAppsMapIsRead) {
+  // The classifier's own reader: atoi rules for keys, strtod in the "C"
+  // locale for values, and a zero byte ends either.
+  FeatureMap f = parseServerFeatures(
+      R"({"  7x": "1", "+3": "2", "-5": "3", "abc": "4", "000000000011": "5", "2147483647": "6",
+          "-2147483648": "7", "2147483648": "8", "99999999999999999999999": "9", "12": "1\u00005",
+          "13\u00009": " \t+.5e1x"})",
+      "sf");
+  EXPECT_EQ(f, (FeatureMap{{7, 1.0}, {3, 2.0}, {-5, 3.0}, {0, 4.0}, {11, 5.0}, {2147483647, 6.0},
+                           {-2147483647 - 1, 7.0}, {12, 1.0}, {13, 5.0}}));
 }
 
 TEST(ServerFeatures, ValuesFollowStrtodAndTheFirstKeyWins) {
@@ -56,6 +54,24 @@ TEST(ServerFeatures, ValuesFollowStrtodAndTheFirstKeyWins) {
       R"({"12": "0.5", "5": "2.5kg", "05": "9", "7": "letters", "8": 1.25e2, "9": -0, "4294967296": "1"})", "sf");
   EXPECT_EQ(f, (FeatureMap{{12, 0.5}, {5, 2.5}, {7, 0.0}, {8, 125.0}, {9, 0.0}}));
   EXPECT_TRUE(std::signbit(f[9]));  // a JSON number is taken by its text
+}
+
+TEST(ServerFeatures, RefusesWhatTheStoreWouldNotGiveBack) {
+  // Integral values are stored as their shortest text and read back through a
+  // 64-bit integer, which must hold them exactly.
+  EXPECT_EQ(errorOf([] { parseServerFeatures(R"({"12": "1152921504606846976"})", "sf"); }),
+            "sf:1: feature \"12\": value \"1152921504606846976\" cannot be stored: it would not read back "
+            "(Loss of precision during arithmetic conversion: (double) 1152921504606847000)");
+  for (const char* map : {R"({"3": "9223372036854775808"})", R"({"3": "-9223372036854775809"})",
+                          R"({"3": 9300000000000000000})"}) {
+    EXPECT_THAT(errorOf([&] { parseServerFeatures(map, "sf"); }),
+                HasSubstr("cannot be stored: it would not read back")) << map;
+  }
+  // What does come back: 2^53, a fraction, 1e21 and above (stored with an
+  // exponent), and -0 (as 0, equal to it).
+  FeatureMap kept = parseServerFeatures(
+      R"({"1": "9007199254740992", "2": "0.1", "3": "1e21", "4": "-1.5e300", "5": "-0"})", "sf");
+  EXPECT_EQ(kept, (FeatureMap{{1, 9007199254740992.0}, {2, 0.1}, {3, 1e21}, {4, -1.5e300}, {5, 0.0}}));
 }
 
 TEST(ServerFeatures, RefusesWhatTheStoreCannotHold) {

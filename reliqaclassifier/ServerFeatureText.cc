@@ -1,4 +1,4 @@
-#include "reliqaclassifier/jni/ServerFeatureText.h"
+#include "reliqaclassifier/ServerFeatureText.h"
 
 #include <locale.h>
 #include <stdlib.h>
