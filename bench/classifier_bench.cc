@@ -13,6 +13,7 @@
 #include "host/keystash/TemporaryDirectory.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
+#include "bench/cpu_flags.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
@@ -88,6 +89,7 @@ BENCHMARK(BM_Predict50);
 int main(int argc, char** argv) {
   FLAGS_minloglevel = google::GLOG_WARNING;  // no per-prediction INFO lines in either benchmark
   benchmark::Initialize(&argc, argv);
+  benchmark::AddCustomContext("cpu_flags", reliqa::bench::cpuFlags());
   if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
   benchmark::RunSpecifiedBenchmarks();
   benchmark::Shutdown();

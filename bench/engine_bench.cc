@@ -23,6 +23,7 @@
 #include <string>
 #include <vector>
 
+#include "bench/cpu_flags.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
@@ -159,6 +160,7 @@ int main(int argc, char** argv) {
         ->Unit(benchmark::kMillisecond);
   }
   benchmark::Initialize(&argc, argv);
+  benchmark::AddCustomContext("cpu_flags", reliqa::bench::cpuFlags());
   benchmark::RunSpecifiedBenchmarks();
   benchmark::Shutdown();
   return 0;

@@ -17,11 +17,11 @@
 
 #include <fstream>
 #include <random>
-#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <vector>
 
+#include "bench/cpu_flags.h"
 #include "host/keystash/TemporaryDirectory.h"
 
 extern char** environ;
@@ -134,28 +134,12 @@ BENCHMARK(BM_ClassifyStream50)->Unit(benchmark::kMillisecond)->UseRealTime()->Mi
 void BM_FeaturesStream50(benchmark::State& state) { streamThroughTool(state, false); }
 BENCHMARK(BM_FeaturesStream50)->Unit(benchmark::kMillisecond)->UseRealTime()->MinTime(2.0);
 
-// The flags that decide which kernels run, for the record.
-std::string cpuFlags() {
-  std::ifstream cpuinfo("/proc/cpuinfo");
-  std::string line;
-  while (std::getline(cpuinfo, line)) {
-    if (line.rfind("flags", 0) != 0) continue;
-    std::istringstream words(line.substr(line.find(':') + 1));
-    std::string out, w;
-    while (words >> w) {
-      if (w == "avx2" || w == "avx512f" || w == "fma" || w == "sse4_2" || w == "bmi2") out += (out.empty() ? "" : " ") + w;
-    }
-    return out;
-  }
-  return "unknown";
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
   benchmark::Initialize(&argc, argv);
   if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
-  benchmark::AddCustomContext("cpu_flags", cpuFlags());
+  benchmark::AddCustomContext("cpu_flags", reliqa::bench::cpuFlags());
   const char* forced = std::getenv("SIMDJSON_FORCE_IMPLEMENTATION");
   benchmark::AddCustomContext("simdjson_implementation", forced ? forced : "best available");
   benchmark::RunSpecifiedBenchmarks();

@@ -7,7 +7,13 @@
 // them (or pass their directory as the first argument). Before timing, every
 // row is scored by both, and the verdicts at 0.5 and the largest score
 // difference are reported. After the run a table gives both times per row and
-// their ratio.
+// their ratio, for the walk this CPU picks (BM_Reliqa) and for the scalar walk
+// that machines without AVX-512 run (BM_ReliqaPortable, forced here).
+//
+// Model load, on m2000_d8: XGBoost reading its own UBJSON bytes
+// (BM_XgboostLoad) against a BoostingModel built from the converted model text
+// (BM_ReliqaLoad), both held in memory. The table uses wall time, so that work
+// a library hands to other threads is counted.
 #include <benchmark/benchmark.h>
 #include <glog/logging.h>
 #include <unistd.h>
@@ -26,13 +32,16 @@
 #include <string>
 #include <vector>
 
+#include "bench/cpu_flags.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
 
 namespace {
 
 constexpr int kFeatures = 74;
 constexpr int kRows = 1024;
 const char* const kModels[] = {"m100_d6", "m500_d6", "m2000_d8"};
+const char* const kLoadModel = "m2000_d8";
 
 void check(int rc, const char* what) {
   if (rc != 0) throw std::runtime_error(std::string(what) + ": " + XGBGetLastError());
@@ -98,9 +107,22 @@ class XgboostModel {
   DMatrixHandle proxy_ = nullptr;
 };
 
+// The model's forest compiled again, to be walked by `kernel`; null when the
+// CPU cannot run it.
+std::unique_ptr<thornvale::FastTreeEnsemble<float>> compiledFor(const thornvale::BoostingModel& model,
+                                                                thornvale::WalkKernel kernel) {
+  auto compile = [&](auto ensemble) -> std::unique_ptr<thornvale::FastTreeEnsemble<float>> {
+    if (!ensemble->init(&model.getForest(), false) || !ensemble->useWalkKernel(kernel)) return nullptr;
+    return ensemble;
+  };
+  if (model.uses16BitForest()) return compile(std::make_unique<thornvale::FastTreeEnsembleOOP<short, unsigned>>());
+  return compile(std::make_unique<thornvale::FastTreeEnsembleOOP<int, unsigned>>());
+}
+
 struct Pair {
   std::unique_ptr<XgboostModel> xgboost;
   std::unique_ptr<thornvale::BoostingModel> ours;
+  std::unique_ptr<thornvale::FastTreeEnsemble<float>> portable;  // the scalar walk
 };
 
 std::string gModelDir = RELIQA_XGBOOST_BENCH_MODELS;
@@ -114,6 +136,7 @@ Pair& pairFor(const std::string& name) {
   Pair p;
   p.xgboost = std::make_unique<XgboostModel>(gModelDir + "/" + name + ".json");
   p.ours = std::make_unique<thornvale::BoostingModel>(readAll(gModelDir + "/" + name + ".txt"));
+  p.portable = compiledFor(*p.ours, thornvale::WalkKernel::kScalar);
   return gPairs.emplace(name, std::move(p)).first->second;
 }
 
@@ -126,13 +149,37 @@ void BM_Xgboost(benchmark::State& state, const char* name) {
   }
 }
 
-void BM_Reliqa(benchmark::State& state, const char* name) {
-  const thornvale::FastTreeEnsemble<float>& forest = pairFor(name).ours->getEnsemble();
+void scoreRows(benchmark::State& state, const thornvale::FastTreeEnsemble<float>& forest) {
   size_t i = 0;
   for (auto _ : state) {
     benchmark::DoNotOptimize(forest.score(gRows[i]));
     i = (i + 1) % gRows.size();
   }
+}
+
+void BM_Reliqa(benchmark::State& state, const char* name) { scoreRows(state, pairFor(name).ours->getEnsemble()); }
+
+void BM_ReliqaPortable(benchmark::State& state, const char* name) {
+  Pair& p = pairFor(name);
+  if (!p.portable) return state.SkipWithError("the model cannot be compiled for the scalar walk");
+  scoreRows(state, *p.portable);
+}
+
+void BM_XgboostLoad(benchmark::State& state, const char* name) {
+  const std::string bytes = readAll(gModelDir + "/" + name + ".ubj");
+  for (auto _ : state) {
+    BoosterHandle booster = nullptr;
+    check(XGBoosterCreate(nullptr, 0, &booster), "XGBoosterCreate");
+    check(XGBoosterLoadModelFromBuffer(booster, bytes.data(), bytes.size()), "XGBoosterLoadModelFromBuffer");
+    XGBoosterFree(booster);
+  }
+  state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * bytes.size()));
+}
+
+void BM_ReliqaLoad(benchmark::State& state, const char* name) {
+  const std::string text = readAll(gModelDir + "/" + name + ".txt");
+  for (auto _ : state) benchmark::DoNotOptimize(std::make_unique<thornvale::BoostingModel>(text));
+  state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * text.size()));
 }
 
 // Verdicts at 0.5 and the largest score difference over all rows.
@@ -165,24 +212,37 @@ class RatioReporter : public benchmark::ConsoleReporter {
       if (!r.error_message.empty()) continue;
       bool mean = r.run_type == Run::RT_Aggregate && r.aggregate_name == "mean";
       if (mean || (r.run_type == Run::RT_Iteration && !means_.count(r.run_name.str()))) {
-        times_[r.run_name.str()] = r.GetAdjustedCPUTime();
+        times_[r.run_name.str()] = r.GetAdjustedRealTime();
         if (mean) means_.insert(r.run_name.str());
       }
     }
   }
   void Finalize() override {
     ConsoleReporter::Finalize();
-    std::printf("\n%-10s %16s %16s %10s\n", "model", "XGBoost us/row", "reliqa us/row", "ratio");
+    std::printf("\n%-10s %16s %16s %10s %22s %10s\n", "model", "XGBoost us/row", "reliqa us/row", "ratio",
+                "reliqa portable us/row", "ratio");
     for (const char* name : kModels) {
-      auto x = times_.find(std::string("BM_Xgboost/") + name);
-      auto r = times_.find(std::string("BM_Reliqa/") + name);
-      if (x == times_.end() || r == times_.end()) continue;
-      std::printf("%-10s %16.3f %16.3f %9.1fx\n", name, x->second, r->second, x->second / r->second);
+      double x = timeOf("BM_Xgboost/", name), r = timeOf("BM_Reliqa/", name),
+             p = timeOf("BM_ReliqaPortable/", name);
+      if (x <= 0) continue;
+      std::printf("%-10s %16.3f %16.3f %9.1fx %22.3f %9.1fx\n", name, x, r, r > 0 ? x / r : 0.0, p,
+                  p > 0 ? x / p : 0.0);
+    }
+    double xl = timeOf("BM_XgboostLoad/", kLoadModel), rl = timeOf("BM_ReliqaLoad/", kLoadModel);
+    if (xl > 0 && rl > 0) {
+      std::printf("\nload %s: XGBoost (UBJSON) %.1f ms, reliqa (model text) %.1f ms, reliqa/XGBoost %.2f\n",
+                  kLoadModel, xl, rl, rl / xl);
     }
   }
 
  private:
-  std::map<std::string, double> times_;  // microseconds per row
+  // Microseconds per row (milliseconds per load), 0 when it did not run.
+  double timeOf(const char* benchmark, const char* model) const {
+    auto it = times_.find(std::string(benchmark) + model);
+    return it == times_.end() ? 0.0 : it->second;
+  }
+
+  std::map<std::string, double> times_;
   std::set<std::string> means_;
 };
 
@@ -192,6 +252,7 @@ int main(int argc, char** argv) {
   google::InitGoogleLogging(argv[0]);
   FLAGS_minloglevel = google::GLOG_WARNING;  // the engine logs each model load at INFO
   benchmark::Initialize(&argc, argv);
+  benchmark::AddCustomContext("cpu_flags", reliqa::bench::cpuFlags());
   if (argc > 1) gModelDir = argv[1];
   gRows = makeRows();
   for (const auto& row : gRows) gInterfaces.push_back(XgboostModel::arrayInterface(row));
@@ -207,7 +268,15 @@ int main(int argc, char** argv) {
         ->Unit(benchmark::kMicrosecond);
     benchmark::RegisterBenchmark((std::string("BM_Reliqa/") + name).c_str(), BM_Reliqa, name)
         ->Unit(benchmark::kMicrosecond);
+    benchmark::RegisterBenchmark((std::string("BM_ReliqaPortable/") + name).c_str(), BM_ReliqaPortable, name)
+        ->Unit(benchmark::kMicrosecond);
   }
+  benchmark::RegisterBenchmark((std::string("BM_XgboostLoad/") + kLoadModel).c_str(), BM_XgboostLoad, kLoadModel)
+      ->Unit(benchmark::kMillisecond)
+      ->UseRealTime();
+  benchmark::RegisterBenchmark((std::string("BM_ReliqaLoad/") + kLoadModel).c_str(), BM_ReliqaLoad, kLoadModel)
+      ->Unit(benchmark::kMillisecond)
+      ->UseRealTime();
   RatioReporter reporter;
   benchmark::RunSpecifiedBenchmarks(&reporter);
   benchmark::Shutdown();

@@ -3,7 +3,7 @@
 
     xgboost_models.py RELIQA OUT_DIR
 
-Writes OUT_DIR/{m100_d6,m500_d6,m2000_d8}.{json,txt}: XGBoost JSON models of
+Writes OUT_DIR/{m100_d6,m500_d6,m2000_d8}.{json,ubj,txt}: XGBoost JSON (and UBJSON) models of
 100 trees of depth 6, 500 of depth 6 and 2000 of depth 8 over 74 features
 (named 1 to 74), trained on a fixed synthetic data set, and their conversions
 by `reliqa convert xgboost`. Deterministic for a given XGBoost version.
@@ -37,6 +37,7 @@ def main():
                   "tree_method": "hist", "max_bin": 256, "seed": SEED, "nthread": 2}
         booster = xgb.train(params, data, trees)
         booster.save_model(os.path.join(out, name + ".json"))
+        booster.save_model(os.path.join(out, name + ".ubj"))  # XGBoost's own binary form, for its load time
         subprocess.run([reliqa, "convert", "xgboost", os.path.join(out, name + ".json"), "-o",
                         os.path.join(out, name + ".txt")], check=True)
         print(f"xgboost_models: {name} written", file=sys.stderr)
