@@ -25,6 +25,10 @@ class BoostingModel;
 
 namespace kestrova::reliqaclassifier {
 
+// Every entry of a classifier is stored under "<prefix>_<key>"; a classifier
+// made without a prefix uses this one.
+inline constexpr char kDefaultKeyPrefix[] = "RELIQA";
+
 inline constexpr char kModelKey[] = "model";
 inline constexpr char kModelIdKey[] = "model_id";
 inline constexpr char kThresholdKey[] = "threshold";

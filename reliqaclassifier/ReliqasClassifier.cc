@@ -9,10 +9,6 @@
 
 namespace kestrova::reliqaclassifier {
 
-namespace {
-constexpr char kDefaultKeyPrefix[] = "RELIQA";
-}  // namespace
-
 ReliqasClassifier::ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> store)
     : ReliqasClassifier(std::move(store), kDefaultKeyPrefix) {}
 

@@ -36,7 +36,7 @@ using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
 
 class ReliqasClassifier {
  public:
-  // Key prefix "RELIQA". `store` may be empty: every store access is then
+  // Key prefix kDefaultKeyPrefix ("RELIQA"). `store` may be empty: every store access is then
   // logged as "cache not initiated" and defaults are used.
   explicit ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> store);
   ReliqasClassifier(std::shared_ptr<PersistentKeyValueStore> store, const std::string& keyPrefix);

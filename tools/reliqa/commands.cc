@@ -34,10 +34,6 @@ using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
 
 namespace {
 
-// The classifier's fixed key prefix, needed only to repair a store whose model
-// no classifier can load.
-constexpr char kKeyPrefix[] = "RELIQA";
-
 void warn(const std::string& file, const std::string& what) {
   std::cerr << "reliqa: warning: " << (file.empty() ? "" : file + ": ") << what << std::endl;
 }
@@ -182,7 +178,7 @@ void setModel(const SetModelOptions& o) {
                           "); give a replacement with --model FILE");
     }
     warn(o.store, std::string("the stored model cannot be loaded (") + e.what() + "); replacing it");
-    thornvale::CacheManager cache(store, kKeyPrefix);
+    thornvale::CacheManager cache(store, rc::kDefaultKeyPrefix);  // the classifier's own prefix
     rc::storeModelParams(cache, params);
     classifier = openClassifier(o.store, store);
   }
