@@ -20,6 +20,24 @@ bash scripts/setup.sh
 
 step() { printf '\n==== %s\n' "$*"; }
 
+# Runs every test that the build in $1 registers (extra ctest arguments
+# follow). A build that registers no test, or a run that leaves any
+# registered test out, fails the step.
+run_ctest() {
+  local dir=$1 registered ran log
+  shift
+  registered=$(ctest --test-dir "$dir" -N | sed -n 's/^Total Tests: \([0-9]*\)$/\1/p')
+  log=$(mktemp)
+  ctest --test-dir "$dir" --output-on-failure --no-tests=error -j "$JOBS" "$@" | tee "$log"
+  ran=$(sed -n 's/.* tests failed out of \([0-9]*\)$/\1/p' "$log" | tail -n 1)
+  rm -f "$log"
+  if [ -z "$registered" ] || [ -z "$ran" ] || [ "$ran" -lt "$registered" ]; then
+    echo "test.sh: $dir registers ${registered:-no} tests but ${ran:-none} ran" >&2
+    exit 1
+  fi
+  echo "-- $dir: all $registered registered tests ran"
+}
+
 configure() {  # configure <dir> <cmake args...>
   local dir=$1; shift
   cmake -S "$ROOT" -B "$dir" -G Ninja -Wno-dev "$@" >/dev/null
@@ -28,7 +46,7 @@ configure() {  # configure <dir> <cmake args...>
 step "plain build and tests"
 configure build
 cmake --build build -j "$JOBS"
-ctest --test-dir build --output-on-failure -j "$JOBS"
+run_ctest build
 
 export ASAN_OPTIONS=abort_on_error=1:detect_leaks=1:strict_string_checks=1
 export UBSAN_OPTIONS=halt_on_error=1:print_stacktrace=1
@@ -38,13 +56,13 @@ step "AddressSanitizer + UndefinedBehaviorSanitizer build and tests"
 configure build-asan -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ \
   -DRELIQA_SANITIZER=asan -DRELIQA_BENCH=OFF -DCMAKE_BUILD_TYPE=RelWithDebInfo
 cmake --build build-asan -j "$JOBS"
-ctest --test-dir build-asan --output-on-failure -j "$JOBS" -LE no-sanitizer
+run_ctest build-asan
 
 step "ThreadSanitizer build and tests"
 configure build-tsan -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ \
   -DRELIQA_SANITIZER=tsan -DRELIQA_BENCH=OFF -DCMAKE_BUILD_TYPE=RelWithDebInfo
 cmake --build build-tsan -j "$JOBS"
-ctest --test-dir build-tsan --output-on-failure -j "$JOBS" -LE no-sanitizer
+run_ctest build-tsan
 
 step "fuzzing, ${FUZZ_SECONDS}s per target"
 configure build-fuzz -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ \
@@ -85,7 +103,7 @@ expected=$(classify_example build)
 for abi in arm64 armhf; do
   step "$abi: cross build and tests under the emulator"
   bash scripts/build-abi.sh "$abi"
-  ctest --test-dir "build-$abi" --output-on-failure -j "$JOBS"
+  run_ctest "build-$abi"
   if [ "$(classify_example "build-$abi")" != "$expected" ]; then
     echo "test: build-$abi/bin/reliqa classifies the example differently from build/bin/reliqa" >&2
     exit 1
