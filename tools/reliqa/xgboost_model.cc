@@ -46,12 +46,19 @@ void forEachElement(JsonDoc& doc, array arr, const std::string& path, F&& onElem
   }
 }
 
-// A float exactly as XGBoost wrote it (parsed as float, not via double).
+// A float exactly as XGBoost wrote it (parsed as float, not via double). A
+// number beyond the float range is refused; one below it keeps its rounded
+// value (XGBoost writes subnormal floats).
 float readFloat(JsonDoc& doc, value& v, const std::string& path) {
   doc.getDouble(v, path);  // type and syntax check
   std::string token(v.raw_json_token());
+  while (!token.empty() && (token.back() == ' ' || token.back() == '\n' || token.back() == '\r' ||
+                            token.back() == '\t')) {
+    token.pop_back();
+  }
   errno = 0;
   float f = std::strtof(token.c_str(), nullptr);
+  if (errno == ERANGE && std::isinf(f)) doc.fail(v, path + ": " + token + " is outside the range of a float");
   return f;
 }
 
@@ -177,120 +184,153 @@ void checkTree(JsonDoc& doc, const XgbTree& t, const std::string& path, int64_t 
   }
 }
 
+// Reads the members of an XGBoost model that the conversion needs, one
+// function per JSON object; members it does not know are skipped.
+class XgbReader {
+ public:
+  explicit XgbReader(JsonDoc& doc) : doc_(doc) {}
+
+  XgbModel read() {
+    forEachMember(doc_, doc_.rootObject("an XGBoost JSON model"), "",
+                  [&](std::string_view key, const std::string& p, value& v) {
+                    if (key == "learner") readLearner(v, p);
+                  });
+    doc_.expectEnd();
+    checkModel();
+    return std::move(m_);
+  }
+
+ private:
+  void readLearner(value& v, const std::string& path) {
+    haveLearner_ = true;
+    forEachMember(doc_, doc_.getObject(v, path), path, [&](std::string_view k, const std::string& p, value& x) {
+      if (k == "feature_names") readStrings(x, p, m_.featureNames);
+      else if (k == "feature_types") readStrings(x, p, featureTypes_);
+      else if (k == "objective") readObjective(x, p);
+      else if (k == "learner_model_param") readLearnerParam(x, p);
+      else if (k == "gradient_booster") readBooster(x, p);
+    });
+  }
+
+  void readStrings(value& v, const std::string& path, std::vector<std::string>& out) {
+    forEachElement(doc_, doc_.getArray(v, path), path,
+                   [&](size_t, const std::string& p, value& s) { out.push_back(doc_.getString(s, p)); });
+  }
+
+  void readObjective(value& v, const std::string& path) {
+    forEachMember(doc_, doc_.getObject(v, path), path, [&](std::string_view k, const std::string& p, value& x) {
+      if (k == "name") {
+        m_.objective = doc_.getString(x, p);
+        haveObjective_ = true;
+      }
+    });
+  }
+
+  void readLearnerParam(value& v, const std::string& path) {
+    forEachMember(doc_, doc_.getObject(v, path), path, [&](std::string_view k, const std::string& p, value& x) {
+      if (k == "base_score") {
+        readBaseScore(x, p);
+      } else if (k == "num_feature") {
+        m_.numFeature = paramInt(doc_, x, p);
+        haveNumFeature_ = true;
+      } else if (k == "num_class") {
+        numClass_ = paramInt(doc_, x, p);
+      } else if (k == "num_target") {
+        numTarget_ = paramInt(doc_, x, p);
+      }
+    });
+  }
+
+  // "5E-1", or "[5E-1]" from newer versions.
+  void readBaseScore(value& v, const std::string& path) {
+    baseScoreText_ = paramText(doc_, v, path);
+    if (baseScoreText_.size() >= 2 && baseScoreText_.front() == '[' && baseScoreText_.back() == ']') {
+      baseScoreText_ = baseScoreText_.substr(1, baseScoreText_.size() - 2);
+      if (baseScoreText_.find(',') != std::string::npos) {
+        doc_.fail(v, path + ": one base score per output; multi-output models cannot be converted");
+      }
+    }
+    char* end = nullptr;
+    m_.baseScore = std::strtof(baseScoreText_.c_str(), &end);
+    if (baseScoreText_.empty() || *end != '\0') {
+      doc_.fail(v, path + ": expected a number, got " + quoteForMessage(baseScoreText_));
+    }
+  }
+
+  void readBooster(value& v, const std::string& path) {
+    forEachMember(doc_, doc_.getObject(v, path), path, [&](std::string_view k, const std::string& p, value& x) {
+      if (k == "name") m_.booster = doc_.getString(x, p);
+      else if (k == "model") readBoosterModel(x, p);
+    });
+  }
+
+  void readBoosterModel(value& v, const std::string& path) {
+    forEachMember(doc_, doc_.getObject(v, path), path, [&](std::string_view k, const std::string& p, value& x) {
+      if (k == "trees") {
+        haveTrees_ = true;
+        treesAt_ = x.raw_json_token().data();
+        forEachElement(doc_, doc_.getArray(x, p), p, [&](size_t, const std::string& q, value& tree) {
+          m_.trees.push_back(readTree(doc_, tree, q));
+        });
+      } else if (k == "gbtree_model_param") {
+        forEachMember(doc_, doc_.getObject(x, p), p, [&](std::string_view g, const std::string& q, value& y) {
+          if (g == "num_trees") numTrees_ = paramInt(doc_, y, q);
+        });
+      }
+    });
+  }
+
+  // What a model must be to be converted, once it has been read.
+  void checkModel() const {
+    auto whole = [&](const std::string& what) { throw ToolError(doc_.name(), 0, what); };
+    if (!haveLearner_) whole("not an XGBoost JSON model (no \"learner\" member); save it with save_model(\"model.json\")");
+    if (m_.booster == "gblinear") whole("linear boosters (gblinear) cannot be converted; only gbtree models");
+    if (m_.booster == "dart") whole("dart boosters cannot be converted; only gbtree models");
+    if (m_.booster != "gbtree") whole("booster " + quoteForMessage(m_.booster) + " cannot be converted; only gbtree models");
+    if (!haveObjective_) whole("the model names no objective (learner.objective.name)");
+    if (m_.objective != "binary:logistic" && m_.objective != "reg:logistic") {
+      whole("objective " + quoteForMessage(m_.objective) +
+            " cannot be converted; only binary:logistic and reg:logistic models");
+    }
+    if (numClass_ > 1) whole("multi-class models (num_class " + std::to_string(numClass_) + ") cannot be converted");
+    if (numTarget_ > 1) whole("multi-output models (num_target " + std::to_string(numTarget_) + ") cannot be converted");
+    if (!haveNumFeature_ || m_.numFeature <= 0) whole("learner_model_param.num_feature is missing or not positive");
+    if (m_.numFeature > std::numeric_limits<int32_t>::max()) whole("too many features");
+    if (!haveTrees_) whole("the model has no trees (gradient_booster.model.trees)");
+    if (numTrees_ >= 0 && static_cast<size_t>(numTrees_) != m_.trees.size()) {
+      throw ToolError(doc_.name(), doc_.lineOf(treesAt_),
+                      "gbtree_model_param.num_trees is " + std::to_string(numTrees_) + " but there are " +
+                          std::to_string(m_.trees.size()) + " trees");
+    }
+    if (!(m_.baseScore > 0.0f && m_.baseScore < 1.0f)) {
+      whole("base_score " + baseScoreText_ + " is not a probability strictly between 0 and 1");
+    }
+    if (!m_.featureNames.empty() && static_cast<int64_t>(m_.featureNames.size()) != m_.numFeature) {
+      whole("the model has " + std::to_string(m_.featureNames.size()) + " feature names for " +
+            std::to_string(m_.numFeature) + " features");
+    }
+    for (const std::string& t : featureTypes_) {
+      if (t == "c") whole("the model has categorical features, which cannot be converted");
+    }
+    for (size_t i = 0; i < m_.trees.size(); ++i) {
+      checkTree(doc_, m_.trees[i], "tree " + std::to_string(i), m_.numFeature);
+    }
+  }
+
+  JsonDoc& doc_;
+  XgbModel m_;
+  std::string baseScoreText_;
+  std::vector<std::string> featureTypes_;
+  bool haveLearner_ = false, haveTrees_ = false, haveObjective_ = false, haveNumFeature_ = false;
+  int64_t numClass_ = 0, numTarget_ = 1, numTrees_ = -1;
+  const char* treesAt_ = nullptr;
+};
+
 }  // namespace
 
 XgbModel readXgboostModel(std::string_view json, const std::string& name) {
   JsonDoc doc(json, name);
-  XgbModel m;
-  std::string baseScoreText;
-  bool haveLearner = false, haveTrees = false, haveObjective = false, haveNumFeature = false;
-  int64_t numClass = 0, numTarget = 1, numTrees = -1;
-  std::vector<std::string> featureTypes;
-  const char* treesAt = nullptr;
-
-  object root = doc.rootObject("an XGBoost JSON model");
-  forEachMember(doc, root, "", [&](std::string_view key, const std::string& p, value& learner) {
-    if (key != "learner") return;
-    haveLearner = true;
-    forEachMember(doc, doc.getObject(learner, p), p, [&](std::string_view k, const std::string& q, value& x) {
-      if (k == "feature_names") {
-        forEachElement(doc, doc.getArray(x, q), q, [&](size_t, const std::string& r, value& s) {
-          m.featureNames.push_back(doc.getString(s, r));
-        });
-      } else if (k == "feature_types") {
-        forEachElement(doc, doc.getArray(x, q), q, [&](size_t, const std::string& r, value& s) {
-          featureTypes.push_back(doc.getString(s, r));
-        });
-      } else if (k == "objective") {
-        forEachMember(doc, doc.getObject(x, q), q, [&](std::string_view o, const std::string& r, value& y) {
-          if (o == "name") {
-            m.objective = doc.getString(y, r);
-            haveObjective = true;
-          }
-        });
-      } else if (k == "learner_model_param") {
-        forEachMember(doc, doc.getObject(x, q), q, [&](std::string_view o, const std::string& r, value& y) {
-          if (o == "base_score") {
-            baseScoreText = paramText(doc, y, r);
-            if (baseScoreText.size() >= 2 && baseScoreText.front() == '[' && baseScoreText.back() == ']') {
-              baseScoreText = baseScoreText.substr(1, baseScoreText.size() - 2);
-              if (baseScoreText.find(',') != std::string::npos) {
-                doc.fail(y, r + ": one base score per output; multi-output models cannot be converted");
-              }
-            }
-            char* end = nullptr;
-            m.baseScore = std::strtof(baseScoreText.c_str(), &end);
-            if (baseScoreText.empty() || *end != '\0') {
-              doc.fail(y, r + ": expected a number, got " + quoteForMessage(baseScoreText));
-            }
-          } else if (o == "num_feature") {
-            m.numFeature = paramInt(doc, y, r);
-            haveNumFeature = true;
-          } else if (o == "num_class") {
-            numClass = paramInt(doc, y, r);
-          } else if (o == "num_target") {
-            numTarget = paramInt(doc, y, r);
-          }
-        });
-      } else if (k == "gradient_booster") {
-        forEachMember(doc, doc.getObject(x, q), q, [&](std::string_view o, const std::string& r, value& y) {
-          if (o == "name") {
-            m.booster = doc.getString(y, r);
-          } else if (o == "model") {
-            forEachMember(doc, doc.getObject(y, r), r, [&](std::string_view t, const std::string& s, value& z) {
-              if (t == "trees") {
-                haveTrees = true;
-                treesAt = z.raw_json_token().data();
-                forEachElement(doc, doc.getArray(z, s), s, [&](size_t, const std::string& u, value& tree) {
-                  m.trees.push_back(readTree(doc, tree, u));
-                });
-              } else if (t == "gbtree_model_param") {
-                forEachMember(doc, doc.getObject(z, s), s, [&](std::string_view g, const std::string& u, value& w) {
-                  if (g == "num_trees") numTrees = paramInt(doc, w, u);
-                });
-              }
-            });
-          }
-        });
-      }
-    });
-  });
-  doc.expectEnd();
-
-  auto whole = [&](const std::string& what) { throw ToolError(name, 0, what); };
-  if (!haveLearner) whole("not an XGBoost JSON model (no \"learner\" member); save it with save_model(\"model.json\")");
-  if (m.booster == "gblinear") whole("linear boosters (gblinear) cannot be converted; only gbtree models");
-  if (m.booster == "dart") whole("dart boosters cannot be converted; only gbtree models");
-  if (m.booster != "gbtree") whole("booster " + quoteForMessage(m.booster) + " cannot be converted; only gbtree models");
-  if (!haveObjective) whole("the model names no objective (learner.objective.name)");
-  if (m.objective != "binary:logistic" && m.objective != "reg:logistic") {
-    whole("objective " + quoteForMessage(m.objective) +
-          " cannot be converted; only binary:logistic and reg:logistic models");
-  }
-  if (numClass > 1) whole("multi-class models (num_class " + std::to_string(numClass) + ") cannot be converted");
-  if (numTarget > 1) whole("multi-output models (num_target " + std::to_string(numTarget) + ") cannot be converted");
-  if (!haveNumFeature || m.numFeature <= 0) whole("learner_model_param.num_feature is missing or not positive");
-  if (m.numFeature > std::numeric_limits<int32_t>::max()) whole("too many features");
-  if (!haveTrees) whole("the model has no trees (gradient_booster.model.trees)");
-  if (numTrees >= 0 && static_cast<size_t>(numTrees) != m.trees.size()) {
-    throw ToolError(name, doc.lineOf(treesAt),
-                    "gbtree_model_param.num_trees is " + std::to_string(numTrees) + " but there are " +
-                        std::to_string(m.trees.size()) + " trees");
-  }
-  if (!(m.baseScore > 0.0f && m.baseScore < 1.0f)) {
-    whole("base_score " + baseScoreText + " is not a probability strictly between 0 and 1");
-  }
-  if (!m.featureNames.empty() && static_cast<int64_t>(m.featureNames.size()) != m.numFeature) {
-    whole("the model has " + std::to_string(m.featureNames.size()) + " feature names for " +
-          std::to_string(m.numFeature) + " features");
-  }
-  for (const std::string& t : featureTypes) {
-    if (t == "c") whole("the model has categorical features, which cannot be converted");
-  }
-  for (size_t i = 0; i < m.trees.size(); ++i) {
-    checkTree(doc, m.trees[i], "tree " + std::to_string(i), m.numFeature);
-  }
-  return m;
+  return XgbReader(doc).read();
 }
 
 std::vector<int64_t> parseIdList(const std::string& text) {

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <limits>
 
 #include "tools/reliqa/errors.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
@@ -133,6 +134,11 @@ TEST(XgboostModel, RefusesMalformedTrees) {
   EXPECT_THAT(errorOf(withTree1("0.25,-1E-1", "0.25")), HasSubstr("split_conditions has 4 entries"));
   EXPECT_THAT(errorOf(withTree1("[1,-1,3,-1,-1]", "[1,-1,3,-1,\"x\"]")),
               HasSubstr("left_children[4]: expected an integer, got a string"));
+  // Beyond the float range is refused; below it, the subnormal float stays.
+  EXPECT_THAT(errorOf(withTree1("2E0,3E-1", "1E39,3E-1")),
+              HasSubstr("split_conditions[2]: 1E39 is outside the range of a float"));
+  XgbModel tiny = readXgboostModel(withTree1("3E-1,5E-1", "1E-45,5E-1"), "m.json");
+  EXPECT_EQ(tiny.trees[0].splitCondition[3], std::numeric_limits<float>::denorm_min());
 }
 
 }  // namespace
