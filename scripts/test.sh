@@ -38,9 +38,9 @@ run_ctest() {
   echo "-- $dir: all $registered registered tests ran"
 }
 
-configure() {  # configure <dir> <cmake args...>
+configure() {  # configure <dir> <cmake args...>; warnings are errors in every build
   local dir=$1; shift
-  cmake -S "$ROOT" -B "$dir" -G Ninja -Wno-dev "$@" >/dev/null
+  cmake -S "$ROOT" -B "$dir" -G Ninja -Wno-dev -DRELIQA_WERROR=ON "$@" >/dev/null
 }
 
 step "plain build and tests"
@@ -102,7 +102,7 @@ classify_example() {
 expected=$(classify_example build)
 for abi in arm64 armhf; do
   step "$abi: cross build and tests under the emulator"
-  bash scripts/build-abi.sh "$abi"
+  bash scripts/build-abi.sh "$abi" -DRELIQA_WERROR=ON
   run_ctest "build-$abi"
   if [ "$(classify_example "build-$abi")" != "$expected" ]; then
     echo "test: build-$abi/bin/reliqa classifies the example differently from build/bin/reliqa" >&2
