@@ -156,7 +156,7 @@ void setModel(const SetModelOptions& o) {
         warn(name, "the magic number is " + std::to_string(header.magic) + ", not " +
                        std::to_string(thornvale::kModelMagic) + "; stored all the same, as the classifier reads it");
       }
-      if (header.version < 2 || header.version > 4) {
+      if (!thornvale::isReadableVersion(header.version)) {
         warn(name, "format version " + std::to_string(header.version) +
                        " is not 2, 3 or 4: the model reads as empty and every score will be 0.5; stored all the same");
       } else if (model->getForest().trees.empty()) {
@@ -288,7 +288,7 @@ void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
   std::unique_ptr<thornvale::Forest> forest = toForest(xgb, ids);
   std::string text;
   try {
-    text = thornvale::writeModel(*forest, 4);
+    text = thornvale::writeModel(*forest, thornvale::kNewestVersion);
     loadModel(name, text);  // what we write must load
   } catch (const std::exception& e) {
     throw ToolError(name, 0, std::string("the converted model is not usable: ") + e.what());

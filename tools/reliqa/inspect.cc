@@ -91,7 +91,7 @@ std::string describeModel(const std::string& name, const std::string& modelText,
   ModelHeader header = readModelHeader(modelText);
   row(out, "model", name + " (" + std::to_string(modelText.size()) + " bytes)");
   std::string format = "version " + std::to_string(header.version);
-  if (header.version < 2 || header.version > 4) format += " (unknown to the reader: the model is empty)";
+  if (!thornvale::isReadableVersion(header.version)) format += " (unknown to the reader: the model is empty)";
   if (header.magic != thornvale::kModelMagic) format += ", wrong magic number " + std::to_string(header.magic);
   row(out, "format", format);
   row(out, "base score", thornvale::doubleToText(forest.baseScore));

@@ -9,8 +9,6 @@ namespace thornvale {
 
 namespace {
 
-constexpr char kAlphabet[] = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
-
 // Little-endian record under construction.
 class Record {
  public:
@@ -22,8 +20,8 @@ class Record {
     for (size_t i = 0; i < sizeof(T); ++i) bytes_.push_back(static_cast<char>(bits >> (8 * i)));
     return *this;
   }
-  Record& tag(char t) {
-    bytes_.push_back(t);
+  Record& tag(uint8_t t) {
+    bytes_.push_back(static_cast<char>(t));
     return *this;
   }
   const std::string& bytes() const { return bytes_; }
@@ -56,11 +54,11 @@ void putNodes(Record& r, const Node& root, const std::string& label) {
     pending.pop_back();
     if (n == nullptr) throw std::invalid_argument(label + " has a split without both children");
     if (n->isLeaf()) {
-      r.tag('C').put(static_cast<const ConstantNode*>(n)->value);
+      r.tag(kLeafTag).put(static_cast<const ConstantNode*>(n)->value);
       continue;
     }
     const auto* split = static_cast<const LinearNode*>(n);
-    r.tag('L').put(split->pivotIndex).put(split->pivotValue);
+    r.tag(kSplitTag).put(split->pivotIndex).put(split->pivotValue);
     pending.push_back(split->right.get());
     pending.push_back(split->left.get());
   }
@@ -88,26 +86,26 @@ std::string base64_encode(std::string_view bytes) {
     const uint32_t b1 = i + 1 < n ? p[i + 1] : 0;
     const uint32_t b2 = i + 2 < n ? p[i + 2] : 0;
     const uint32_t group = (b0 << 16) | (b1 << 8) | b2;
-    out += kAlphabet[(group >> 18) & 63];
-    out += kAlphabet[(group >> 12) & 63];
-    out += kAlphabet[(group >> 6) & 63];
-    out += kAlphabet[group & 63];
+    out += kBase64Alphabet[(group >> 18) & 63];
+    out += kBase64Alphabet[(group >> 12) & 63];
+    out += kBase64Alphabet[(group >> 6) & 63];
+    out += kBase64Alphabet[group & 63];
   }
   const size_t padding = (3 - n % 3) % 3;
-  out.append(padding, '=');
+  out.append(padding, kBase64Padding);
   return out;
 }
 
 std::string writeModel(const Forest& forest, int32_t version) {
-  if (version < 2 || version > 4) {
+  if (!isReadableVersion(version)) {
     throw std::invalid_argument("model format version " + std::to_string(version) +
                                 " cannot be written; use 2, 3 or 4");
   }
-  if (version < 3 && (!forest.featureMapping.empty() || !forest.equalityFeatures.empty())) {
+  if (version < kFirstVersionWithMapping && (!forest.featureMapping.empty() || !forest.equalityFeatures.empty())) {
     throw std::invalid_argument(
         "format version 2 has no featureMapping or equalityFeatures; write version 3 or 4");
   }
-  if (version < 4 && !forest.averageFeatureValues.empty()) {
+  if (version < kNewestVersion && !forest.averageFeatureValues.empty()) {
     throw std::invalid_argument(
         "average feature values need format version 4; write version 4 or clear them");
   }
@@ -121,13 +119,13 @@ std::string writeModel(const Forest& forest, int32_t version) {
   }
   text.value(static_cast<uint32_t>(forest.inputKeys.size()));
   for (const std::string& key : forest.inputKeys) text.line(key);
-  if (version >= 3) {
+  if (version >= kFirstVersionWithMapping) {
     text.value(static_cast<uint32_t>(forest.featureMapping.size()));
     for (uint32_t id : forest.featureMapping) text.value(id);
     text.value(static_cast<uint32_t>(forest.equalityFeatures.size()));
     for (uint32_t id : forest.equalityFeatures) text.value(id);
   }
-  if (version == 4) {
+  if (version == kNewestVersion) {
     text.value(static_cast<uint32_t>(forest.averageFeatureValues.size()));
     for (const auto& [id, average] : forest.averageFeatureValues) {
       text.value(id);

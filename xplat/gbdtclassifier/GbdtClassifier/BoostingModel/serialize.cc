@@ -16,10 +16,8 @@ namespace {
 // Decode table: the 64 characters of the alphabet map to 0..63, every other
 // byte (the padding character included) to 0. Constant-initialised.
 constexpr std::array<uint8_t, 256> makeDecodeTable() {
-  constexpr char kAlphabet[] =
-      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/=";
   std::array<uint8_t, 256> table{};
-  for (int i = 0; i < 64; ++i) table[static_cast<unsigned char>(kAlphabet[i])] = static_cast<uint8_t>(i);
+  for (int i = 0; i < 64; ++i) table[static_cast<unsigned char>(kBase64Alphabet[i])] = static_cast<uint8_t>(i);
   return table;
 }
 constexpr std::array<uint8_t, 256> kDecodeTable = makeDecodeTable();
@@ -38,7 +36,7 @@ void decodeInto(std::string_view text, std::string& out) {
     o[1] = static_cast<unsigned char>((c1 << 4) | (c2 >> 2));
     o[2] = static_cast<unsigned char>((c2 << 6) | c3);
   }
-  for (size_t i = groups * 4; i < text.size() && text[i] == '='; ++i) {
+  for (size_t i = groups * 4; i < text.size() && text[i] == kBase64Padding; ++i) {
     if (!out.empty()) out.pop_back();
   }
 }
@@ -130,9 +128,6 @@ struct NodeProblem {
   size_t offset = 0;     // byte offset of the tag within what was read
 };
 
-constexpr uint8_t kLeafTag = 0x43;   // 'C'
-constexpr uint8_t kSplitTag = 0x4C;  // 'L'
-
 // Reads one subtree of pre-order node records with an explicit stack. Returns
 // null (after the error message) when a tag is unknown or missing; the
 // partly built subtree is discarded, so no absent node ever escapes.
@@ -195,10 +190,10 @@ void readTree(std::string_view line, WeightedTree& out, int32_t version, const L
   }
   auto tree = std::make_unique<Tree>();
   tree->root = std::move(root);
-  if (version > 1) {
+  if (version >= kOldestVersion) {  // every readable version: the tree's feature values
     const auto count = src.read<int32_t>();
     if (count > 0) {
-      const uint64_t needed = static_cast<uint64_t>(count) * 12;
+      const uint64_t needed = static_cast<uint64_t>(count) * kFeatureValueBytes;
       if (needed > src.remaining()) {
         throw std::runtime_error(
             label() + " is malformed: its featureValues count " + std::to_string(count) +
@@ -314,14 +309,14 @@ std::unique_ptr<Forest> Reader::read() {
   const int32_t version = parseHeader(decodeNext());
   auto forest = std::make_unique<Forest>();
   std::cout << "Deseralization version: " << version << std::endl;
-  if (version < 2 || version > 4) return forest;
+  if (!isReadableVersion(version)) return forest;
   readTrees(*forest, version);
   readInputKeys(*forest);
-  if (version >= 3) {
+  if (version >= kFirstVersionWithMapping) {
     readFeatureMapping(*forest);
     readEqualityFeatures(*forest);
   }
-  if (version == 4) readAverages(*forest);
+  if (version == kNewestVersion) readAverages(*forest);
   readTrailer(*forest, version);
   return forest;
 }

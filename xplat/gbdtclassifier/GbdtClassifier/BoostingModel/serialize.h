@@ -28,11 +28,10 @@
 #include <string_view>
 #include <vector>
 
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelFormat.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
 
 namespace thornvale {
-
-inline constexpr int32_t kModelMagic = 314156;
 
 // A tree with its weight. Copying deep-copies the tree (links unset).
 struct WeightedTree {
