@@ -8,10 +8,9 @@
 # its header are found directly instead.
 find_library(RELIQA_XGBOOST_LIBRARY NAMES xgboost)
 find_path(RELIQA_XGBOOST_INCLUDE xgboost/c_api.h)
-find_program(RELIQA_BENCH_PYTHON /usr/bin/python3)
-if(NOT RELIQA_XGBOOST_LIBRARY OR NOT RELIQA_XGBOOST_INCLUDE OR NOT TARGET gbdt OR NOT TARGET reliqa)
-  message(STATUS "xgboost_bench: skipped (needs libxgboost-dev and the reliqa tool)")
-  return()
+find_program(RELIQA_BENCH_PYTHON python3 PATHS /usr/bin NO_DEFAULT_PATH REQUIRED)
+if(NOT RELIQA_XGBOOST_LIBRARY OR NOT RELIQA_XGBOOST_INCLUDE)
+  message(FATAL_ERROR "libxgboost-dev not found: install it, or configure with -DRELIQA_BENCH=OFF")
 endif()
 
 set(_xgb_models ${CMAKE_BINARY_DIR}/xgboost-bench-models)

@@ -5,7 +5,6 @@
 # reliqa_tool_models:  XGBoost conversion, model inspection, partial dependence
 #                      (needs the engine).
 # reliqa:              the tool (needs the classifier and the store as well).
-# Parts whose dependencies are not in the tree yet are skipped with a note.
 set(_reliqa_dir ${CMAKE_CURRENT_SOURCE_DIR}/reliqa)
 
 add_library(reliqa_tool_readers STATIC
@@ -21,11 +20,6 @@ target_link_libraries(reliqa_tool_readers PUBLIC reliqa_features reliqa_json sim
 reliqa_test(reliqa_tool_readers_test
   SOURCES ${_reliqa_dir}/collection_reader_test.cc ${_reliqa_dir}/feature_rows_test.cc
   LIBS reliqa_tool_readers)
-
-if(NOT TARGET gbdt OR NOT TARGET reliqa_json)
-  message(STATUS "reliqa tool: waiting for the engine (gbdt, reliqa_json); only its readers are built")
-  return()
-endif()
 
 add_library(reliqa_tool_models STATIC
   ${_reliqa_dir}/inspect.cc
@@ -47,19 +41,12 @@ target_compile_definitions(reliqa_golden_test PRIVATE
   GOLDEN_COLLECTIONS="${_reliqa_dir}/testdata/golden_collections.jsonl"
   GOLDEN_MODEL="${PROJECT_SOURCE_DIR}/examples/model.txt")
 
-if(NOT TARGET reliqa_classifier OR NOT TARGET keystash)
-  message(STATUS "reliqa tool: waiting for the classifier (reliqa_classifier, keystash)")
-  return()
-endif()
-
 add_executable(reliqa ${_reliqa_dir}/main.cc ${_reliqa_dir}/commands.cc)
 target_link_libraries(reliqa PRIVATE reliqa_tool_models reliqa_classifier keystash CLI11::CLI11)
 
 # End-to-end tests of the tool as a user runs it: error paths, JSON Lines
 # streaming, the guard that keeps a rejected model out of the store.
-find_program(RELIQA_DEBIAN_PYTHON /usr/bin/python3)
-if(RELIQA_DEBIAN_PYTHON AND EXISTS ${_reliqa_dir}/cli_test.py)
-  add_test(NAME reliqa_cli_test
-    COMMAND ${RELIQA_DEBIAN_PYTHON} ${_reliqa_dir}/cli_test.py $<TARGET_FILE:reliqa> ${PROJECT_SOURCE_DIR})
-  set_tests_properties(reliqa_cli_test PROPERTIES ENVIRONMENT "${RELIQA_TEST_ENVIRONMENT}" TIMEOUT 300)
-endif()
+find_program(RELIQA_DEBIAN_PYTHON python3 PATHS /usr/bin NO_DEFAULT_PATH NO_CMAKE_FIND_ROOT_PATH REQUIRED)
+add_test(NAME reliqa_cli_test
+  COMMAND ${RELIQA_DEBIAN_PYTHON} ${_reliqa_dir}/cli_test.py $<TARGET_FILE:reliqa> ${PROJECT_SOURCE_DIR})
+set_tests_properties(reliqa_cli_test PROPERTIES ENVIRONMENT "${RELIQA_TEST_ENVIRONMENT}" TIMEOUT 300)
