@@ -54,7 +54,7 @@ ReliqaClassifierInput collectionOf(int assets) {
 }
 
 std::string benchmarkModel() {
-  return thornvale::writeModel(thornvale::testing::randomForest(7, 500, 6, 74), 3);
+  return thornvale::writeModel(thornvale::test::randomForest(7, 500, 6, 74), 3);
 }
 
 const FeatureMap kServerFeatures = {{4, 48.0}, {1001, 0.5}, {1002, 2.0}};

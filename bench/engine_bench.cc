@@ -68,7 +68,7 @@ Fixture& fixture(const Shape& shape, bool sixteenBit) {
   Fixture& f = cache[{&shape, sixteenBit}];
   if (f.model) return f;
   Forest forest =
-      testing::randomForest(42, shape.trees, shape.depth, kInputs, sixteenBit, shape.earlyLeaf);
+      test::randomForest(42, shape.trees, shape.depth, kInputs, sixteenBit, shape.earlyLeaf);
   f.text = writeModel(forest, 4);
   f.forest = std::move(forest);
   {

@@ -44,7 +44,7 @@ void quickAgreesWithCareful(std::string_view text) {
     std::abort();
   }
   if (vouched) {
-    std::string difference = reliqa::tool::testing::recordDifference(quick, careful);
+    std::string difference = reliqa::tool::test::recordDifference(quick, careful);
     if (!difference.empty()) {
       std::fprintf(stderr, "the two passes read %s differently\n", difference.c_str());
       std::abort();

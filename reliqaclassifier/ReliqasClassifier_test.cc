@@ -25,7 +25,7 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMapJson.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/TestLogSink.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
 
 extern char** environ;
 
@@ -34,9 +34,9 @@ namespace {
 
 using kestrova::mobile::xplat::keystash::FakePersistentKeyValueStore;
 using kestrova::mobile::xplat::keystash::TemporaryDirectory;
-using testing::rejectedModel;
-using testing::stumpModel;
-using thornvale::TestLogSink;
+using test::rejectedModel;
+using test::stumpModel;
+using thornvale::test::LogCapture;
 using ::testing::ElementsAre;
 using ::testing::UnorderedElementsAre;
 
@@ -214,7 +214,7 @@ TEST_F(ReliqasClassifierTest, UndecodableStoredValuesThrowAndReleaseTheLock) {
 }
 
 TEST_F(ReliqasClassifierTest, StoreFailuresOnlyLogAndUseDefaults) {
-  TestLogSink log;
+  LogCapture log;
   ReliqasClassifier detached(nullptr);
   detached.setModelParams({modelA, "a", 0.5});
   detached.setServerFeatures({{4, 9.0}});

@@ -8,20 +8,16 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
 
-namespace kestrova::reliqaclassifier::testing {
+namespace kestrova::reliqaclassifier::test {
 
 // One tree of one split on feature `featureId`: `leftLeaf` when the feature is
 // at most `pivot` (a missing feature reads 0.0), `rightLeaf` otherwise.
 inline std::string stumpModel(int32_t featureId, double pivot, double leftLeaf, double rightLeaf) {
-  auto split = std::make_unique<thornvale::LinearNode>(0, pivot);
-  split->left = std::make_unique<thornvale::ConstantNode>(leftLeaf);
-  split->right = std::make_unique<thornvale::ConstantNode>(rightLeaf);
-  auto tree = std::make_unique<thornvale::Tree>();
-  tree->root = std::move(split);
+  namespace t = thornvale::test;
   thornvale::Forest forest;
-  forest.trees.emplace_back(std::move(tree), 1.0);
+  forest.trees.push_back(t::weighted(t::split(0, pivot, t::leaf(leftLeaf), t::leaf(rightLeaf)), 1.0));
   forest.inputKeys = {"f" + std::to_string(featureId)};
   forest.featureMapping = {static_cast<uint32_t>(featureId)};
   return thornvale::writeModel(forest, 3);
@@ -39,4 +35,4 @@ inline std::string rejectedModel() {
   return text;
 }
 
-}  // namespace kestrova::reliqaclassifier::testing
+}  // namespace kestrova::reliqaclassifier::test

@@ -16,9 +16,9 @@
 namespace {
 
 using namespace thornvale;
-using testing::leaf;
-using testing::split;
-using testing::weighted;
+using test::leaf;
+using test::split;
+using test::weighted;
 
 void save(const std::string& path, const std::string& text) {
   std::ofstream out(path, std::ios::binary);
@@ -29,7 +29,7 @@ void save(const std::string& path, const std::string& text) {
 
 // Six inputs fed by feature ids 3, 17, 4, 21, 42 and 8; 12 trees of depth 3.
 Forest demoModel() {
-  Forest f = testing::randomForest(2024, 12, 3, 6);
+  Forest f = test::randomForest(2024, 12, 3, 6);
   f.baseScore = -0.4;
   f.featureMapping = {3, 17, 4, 21, 42, 8};
   f.inputKeys = {"feature_3", "feature_17", "feature_4", "feature_21", "feature_42", "feature_8"};
@@ -50,12 +50,12 @@ int main(int argc, char** argv) {
     save(root + "/examples/demo/model.txt", writeModel(demoModel(), 4));
 
     // Version 2: no metadata, so a constant-score model.
-    Forest v2 = testing::randomForest(1, 3, 2, 3);
+    Forest v2 = test::randomForest(1, 3, 2, 3);
     v2.featureMapping.clear();
     save(seeds + "v2_plain.txt", writeModel(v2, 2));
 
     // Version 3 with an equality feature, a zero-weight and a subnormal-weight tree.
-    Forest v3 = testing::randomForest(2, 4, 2, 4);
+    Forest v3 = test::randomForest(2, 4, 2, 4);
     v3.equalityFeatures = {1};
     v3.trees[1].weight = -0.0;
     v3.trees[2].weight = 5e-324;
@@ -63,14 +63,14 @@ int main(int argc, char** argv) {
     save(seeds + "v3_equality.txt", writeModel(v3, 3));
 
     // Version 4 with averages and a trailer: selector and sub-model boundaries.
-    Forest v4 = testing::randomForest(3, 6, 2, 5);
+    Forest v4 = test::randomForest(3, 6, 2, 5);
     v4.averageFeatureValues = {{1, 0.25}, {5, -1.0}};
     v4.modelSelector = weighted(split(0, 0.0, leaf(0.5), split(2, 0.3, leaf(1.5), leaf(2.7))), 1);
     v4.modelIndexMap = {2, 4};
     save(seeds + "v4_selector.txt", writeModel(v4, 4));
 
     // Version 2 with a trailer and feature values on the trees.
-    Forest v2t = testing::randomForest(4, 3, 1, 2);
+    Forest v2t = test::randomForest(4, 3, 1, 2);
     v2t.featureMapping.clear();
     v2t.trees[0].tree->featureValues = {{0, 1.5}, {1, -2.0}};
     v2t.modelSelector = weighted(leaf(1.0), 1);
@@ -85,7 +85,7 @@ int main(int argc, char** argv) {
     Forest deep;
     deep.inputKeys = {"depth"};
     deep.featureMapping = {1};
-    deep.trees.push_back(weighted(testing::chain(40), 1));
+    deep.trees.push_back(weighted(test::chain(40), 1));
     save(seeds + "v3_chain.txt", writeModel(deep, 3));
   } catch (const std::exception& e) {
     std::cerr << "gbdt-samples: " << e.what() << "\n";

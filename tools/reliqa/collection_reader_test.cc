@@ -141,11 +141,11 @@ TEST(CollectionReader, BothPassesReadTheSameBits) {
     kestrova::reliqaclassifier::ReliqaClassifierInput quick, careful;
     CollectionReader::readCarefully(text, "f.json", 1, careful);
     if (reader.readQuickly(text, quick)) {
-      EXPECT_EQ(testing::recordDifference(quick, careful), "") << text;
+      EXPECT_EQ(test::recordDifference(quick, careful), "") << text;
     }
     kestrova::reliqaclassifier::ReliqaClassifierInput read;
     reader.read(text, "f.json", 1, read);
-    EXPECT_EQ(testing::recordDifference(read, careful), "") << text;
+    EXPECT_EQ(test::recordDifference(read, careful), "") << text;
   }
   // The quick pass does its work on ordinary text.
   kestrova::reliqaclassifier::ReliqaClassifierInput out;
@@ -169,13 +169,13 @@ TEST(CollectionReader, AReusedRecordKeepsNothingOfTheCollectionBefore) {
   reader.read(big, "f.json", 1, reused);
   ASSERT_EQ(reused.assetDetails.size(), 3u);
   reader.read(small, "f.json", 2, reused);
-  EXPECT_EQ(testing::recordDifference(reused, parseCollection(small, "f.json")), "");
+  EXPECT_EQ(test::recordDifference(reused, parseCollection(small, "f.json")), "");
   EXPECT_FALSE(reused.locationInfo.has_value());
   EXPECT_EQ(reused.assetCounts.facesCount, 0);
   // After a refused text the next one still reads whole.
   EXPECT_THROW(reader.read("{\"collectionID\": 1}", "f.json", 3, reused), ToolError);
   reader.read(big, "f.json", 4, reused);
-  EXPECT_EQ(testing::recordDifference(reused, parseCollection(big, "f.json")), "");
+  EXPECT_EQ(test::recordDifference(reused, parseCollection(big, "f.json")), "");
 }
 
 }  // namespace

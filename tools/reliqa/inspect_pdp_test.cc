@@ -6,6 +6,7 @@
 #include "tools/reliqa/inspect.h"
 #include "tools/reliqa/pdp.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
 
 namespace reliqa::tool {
 namespace {
@@ -18,12 +19,8 @@ using thornvale::LinearNode;
 
 // A tree that splits position `pos` at `pivot` into leaves `l` and `r`.
 std::unique_ptr<thornvale::Tree> stump(int32_t pos, double pivot, double l, double r) {
-  auto split = std::make_unique<LinearNode>(pos, pivot);
-  split->left = std::make_unique<ConstantNode>(l);
-  split->right = std::make_unique<ConstantNode>(r);
-  auto tree = std::make_unique<thornvale::Tree>();
-  tree->root = std::move(split);
-  return tree;
+  namespace t = thornvale::test;
+  return t::tree(t::split(pos, pivot, t::leaf(l), t::leaf(r)));
 }
 
 Forest twoInputForest() {

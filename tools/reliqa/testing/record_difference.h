@@ -9,7 +9,7 @@
 
 #include "reliqaclassifier/ReliqaClassifierInput.h"
 
-namespace reliqa::tool::testing {
+namespace reliqa::tool::test {
 
 namespace detail {
 
@@ -78,4 +78,4 @@ inline std::string recordDifference(const kestrova::reliqaclassifier::ReliqaClas
   return d.first;
 }
 
-}  // namespace reliqa::tool::testing
+}  // namespace reliqa::tool::test

@@ -9,7 +9,7 @@
 #include "host/keystash/FakePersistentKeyValueStore.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/TestLogSink.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
 
 namespace thornvale {
 namespace {
@@ -18,12 +18,13 @@ using kestrova::mobile::xplat::keystash::FakePersistentKeyValueStore;
 using kestrova::mobile::xplat::keystash::FutureError;
 using Failure = FakePersistentKeyValueStore::Failure;
 using ::testing::ElementsAre;
+using test::LogCapture;
 
 class CacheManagerTest : public ::testing::Test {
  protected:
   std::shared_ptr<FakePersistentKeyValueStore> store = std::make_shared<FakePersistentKeyValueStore>();
   CacheManager cache{store, "RELIQA"};
-  TestLogSink log;
+  LogCapture log;
 };
 
 TEST_F(CacheManagerTest, EncodesEachTypeUnderThePrefixedKey) {
@@ -46,7 +47,7 @@ TEST_F(CacheManagerTest, EncodesEachTypeUnderThePrefixedKey) {
   EXPECT_EQ(cache.fetch("absent", 0.25), 0.25);
   EXPECT_EQ(cache.fetch("absent", "dflt"), "dflt");
   EXPECT_EQ(cache.fetch("absent", FeatureMap{{1, 1.0}}), (FeatureMap{{1, 1.0}}));
-  EXPECT_TRUE(log.lines().empty());
+  EXPECT_TRUE(log.entries().empty());
 }
 
 TEST_F(CacheManagerTest, UndecodableValuesThrowInsteadOfDefaultingAndLogNothing) {
@@ -58,7 +59,7 @@ TEST_F(CacheManagerTest, UndecodableValuesThrowInsteadOfDefaultingAndLogNothing)
   EXPECT_THROW(cache.fetch("server_features", FeatureMap{}), JsonTypeError);
   store->put("RELIQA_server_features", "{\"4\":");
   EXPECT_THROW(cache.fetch("server_features", FeatureMap{}), JsonParseError);
-  EXPECT_TRUE(log.lines().empty());
+  EXPECT_TRUE(log.entries().empty());
 }
 
 TEST_F(CacheManagerTest, NonFiniteNumbersAreRefusedBeforeTheStoreIsCalled) {
@@ -75,13 +76,13 @@ TEST_F(CacheManagerTest, WithoutAStoreEveryCallLogsAndDefaults) {
   CacheManager detached(nullptr, "RELIQA");
   EXPECT_EQ(detached.fetch("model_id", "none"), "none");
   detached.store("threshold", std::nan(""));  // nothing to store into: not even encoded
-  std::vector<TestLogSink::Line> lines = log.lines();
+  std::vector<LogCapture::Entry> lines = log.entries();
   ASSERT_EQ(lines.size(), 2u);
   EXPECT_EQ(lines[0].severity, google::GLOG_ERROR);
-  EXPECT_EQ(lines[0].message, "cache not initiated, tried to fetch: RELIQA_model_id");
+  EXPECT_EQ(lines[0].text, "cache not initiated, tried to fetch: RELIQA_model_id");
   EXPECT_EQ(lines[0].file + ":" + std::to_string(lines[0].line), "CacheManager.cc:105");
   EXPECT_EQ(lines[1].severity, google::GLOG_ERROR);
-  EXPECT_EQ(lines[1].message, "cache not initiated, tried to store with key: RELIQA_threshold");
+  EXPECT_EQ(lines[1].text, "cache not initiated, tried to store with key: RELIQA_threshold");
   EXPECT_EQ(lines[1].file + ":" + std::to_string(lines[1].line), "CacheManager.cc:131");
 }
 
@@ -100,7 +101,7 @@ TEST_F(CacheManagerTest, StoreFailuresAreLoggedAndAbsorbedWhereverTheyArise) {
                                           "error storing: RELIQA_threshold, exception: Unknown error",
                                           "error fetching: RELIQA_threshold, exception: disk gone",
                                           "error storing: RELIQA_threshold, exception: Unknown error"));
-  std::vector<TestLogSink::Line> lines = log.lines();
+  std::vector<LogCapture::Entry> lines = log.entries();
   EXPECT_EQ(lines[0].line, 113);
   EXPECT_EQ(lines[1].line, 140);
   EXPECT_EQ(lines[0].severity, google::GLOG_ERROR);
@@ -111,7 +112,7 @@ TEST_F(CacheManagerTest, ExceptionsThatAreNotStdExceptionsPassThrough) {
   EXPECT_THROW(cache.fetch("threshold", 0.0), int);
   store->failStores(Failure::kInCall, std::make_exception_ptr(7));
   EXPECT_THROW(cache.store("model", "m"), int);
-  EXPECT_TRUE(log.lines().empty());
+  EXPECT_TRUE(log.entries().empty());
 }
 
 }  // namespace

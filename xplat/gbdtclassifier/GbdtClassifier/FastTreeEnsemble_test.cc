@@ -10,15 +10,16 @@
 #include <tuple>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
 
 namespace thornvale {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
-using testing::leaf;
-using testing::split;
-using testing::weighted;
+using test::leaf;
+using test::split;
+using test::weighted;
 
 using Forest16 = FastTreeEnsembleOOP<short, unsigned int>;
 using Forest32 = FastTreeEnsembleOOP<int, unsigned int>;
@@ -205,7 +206,7 @@ TEST(SubModels, SelectorChoosesTreeRanges) {
 }
 
 TEST(InitResults, NullDecreasingMapAndRemapWithoutMapping) {
-  testing::LogCapture log;
+  test::LogCapture log;
   Forest32 e;
   EXPECT_FALSE(e.init(nullptr, false));
 
@@ -290,11 +291,11 @@ void checkAgainstReference(uint64_t seed) {
   std::mt19937_64 rng(seed);
   for (int round = 0; round < 12; ++round) {
     const size_t count = 1 + rng() % 40;
-    Forest f = testing::randomForest(rng(), count, 1 + static_cast<int>(rng() % 6), 10);
+    Forest f = test::randomForest(rng(), count, 1 + static_cast<int>(rng() % 6), 10);
     f.trees[rng() % count].weight = 0.0;
     if (round % 3 != 0) f.equalityFeatures = {static_cast<uint32_t>(rng() % 10)};
     if (round % 2 == 1) {
-      f.modelSelector = weighted(testing::randomFullTree(rng, 2, 10), 1);
+      f.modelSelector = weighted(test::randomFullTree(rng, 2, 10), 1);
       std::vector<Node*> pending{f.modelSelector.tree->root.get()};
       while (!pending.empty()) {  // selector leaves name models 0..3
         Node* n = pending.back();
@@ -321,12 +322,12 @@ void checkAgainstReference(uint64_t seed) {
         if (!root->isLeaf()) x[root->pivotIndex] = static_cast<float>(root->pivotValue);
       }
       const double expected = referenceRaw(f, x);
-      ASSERT_TRUE(testing::sameBits(e->unnormalizedScore(x), expected)) << round << "/" << v;
-      ASSERT_TRUE(testing::sameBits(e->unnormalizedScoreOneByOne(x), expected)) << round;
-      ASSERT_TRUE(testing::sameBits(e->score(x), logistic(expected)));
+      ASSERT_TRUE(test::sameBits(e->unnormalizedScore(x), expected)) << round << "/" << v;
+      ASSERT_TRUE(test::sameBits(e->unnormalizedScoreOneByOne(x), expected)) << round;
+      ASSERT_TRUE(test::sameBits(e->score(x), logistic(expected)));
     }
     const std::vector<float> zeros(10, 0.0f);
-    EXPECT_TRUE(testing::sameBits(e->unnormalizedScoreOfZeros(), referenceRaw(f, zeros)));
+    EXPECT_TRUE(test::sameBits(e->unnormalizedScoreOfZeros(), referenceRaw(f, zeros)));
   }
 }
 
@@ -347,14 +348,14 @@ void checkKernels(uint64_t seed, int32_t numFeatures) {
   std::mt19937_64 rng(seed);
   for (int round = 0; round < 6; ++round) {
     const size_t count = 1 + rng() % (2 * kWalkGroup + 20);
-    Forest f = testing::randomForest(rng(), count, 1 + static_cast<int>(rng() % 10), numFeatures,
+    Forest f = test::randomForest(rng(), count, 1 + static_cast<int>(rng() % 10), numFeatures,
                                      false, round % 2 ? 0.3 : 0.0);
     for (size_t i = 0; i < count; i += 1 + rng() % 16) {
       switch (rng() % 4) {
         case 0: f.trees[i].tree->root = leaf(0.25 * static_cast<double>(i)); break;
         case 1: f.trees[i].weight = 0.0; break;
-        case 2: f.trees[i].tree->root = testing::randomFullTree(rng, 1 + rng() % 10, numFeatures, 0.4); break;
-        default: f.trees[i].tree->root = testing::chain(E::kMaxGatherDepth + 1 + rng() % 3, numFeatures - 1);
+        case 2: f.trees[i].tree->root = test::randomFullTree(rng, 1 + rng() % 10, numFeatures, 0.4); break;
+        default: f.trees[i].tree->root = test::chain(E::kMaxGatherDepth + 1 + rng() % 3, numFeatures - 1);
       }
     }
     if (round % 3 == 1) f.equalityFeatures = {static_cast<uint32_t>(rng() % numFeatures)};
@@ -385,7 +386,7 @@ void checkKernels(uint64_t seed, int32_t numFeatures) {
       const double expected = e->unnormalizedScoreOneByOne(x);
       for (WalkKernel k : kernels) {
         ASSERT_TRUE(e->useWalkKernel(k));
-        ASSERT_TRUE(testing::sameBits(e->unnormalizedScore(x), expected))
+        ASSERT_TRUE(test::sameBits(e->unnormalizedScore(x), expected))
             << "kernel " << static_cast<int>(k) << ", round " << round << ", vector " << v;
       }
     }
@@ -406,11 +407,11 @@ TEST(Kernels, ForestsWithoutGroupWalk) {
   for (int i = 0; i < 200; ++i) leaves.trees.push_back(weighted(leaf(i), 0.5));
   auto e = compiled(leaves);
   EXPECT_GT(e->gatherBytes(), 0u);
-  EXPECT_TRUE(testing::sameBits(e->unnormalizedScore({}), e->unnormalizedScoreOneByOne({})));
+  EXPECT_TRUE(test::sameBits(e->unnormalizedScore({}), e->unnormalizedScoreOneByOne({})));
 
   // Too many feature positions for the copy on the stack, and only trees
   // that the group walk does not take: no walk nodes, the compiled walks.
-  Forest wide = testing::randomForest(5, 20, 4, 3000);
+  Forest wide = test::randomForest(5, 20, 4, 3000);
   auto w = compiled(wide);
   Forest eq = mapped(4);
   for (int i = 0; i < 20; ++i) eq.trees.push_back(weighted(split(3, 0.5, leaf(1), leaf(i)), 1));
@@ -419,8 +420,8 @@ TEST(Kernels, ForestsWithoutGroupWalk) {
   EXPECT_EQ(w->gatherBytes(), 0u);
   EXPECT_EQ(q->gatherBytes(), 0u);
   std::vector<float> x(3000, 0.5f);
-  EXPECT_TRUE(testing::sameBits(w->unnormalizedScore(x), w->unnormalizedScoreOneByOne(x)));
-  EXPECT_TRUE(testing::sameBits(q->unnormalizedScore(x), q->unnormalizedScoreOneByOne(x)));
+  EXPECT_TRUE(test::sameBits(w->unnormalizedScore(x), w->unnormalizedScoreOneByOne(x)));
+  EXPECT_TRUE(test::sameBits(q->unnormalizedScore(x), q->unnormalizedScoreOneByOne(x)));
 }
 
 }  // namespace

@@ -9,29 +9,26 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
 
 namespace thornvale {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
-using testing::leaf;
-using testing::LogCapture;
-using testing::split;
-using testing::weighted;
+using test::leaf;
+using test::LogCapture;
+using test::split;
+using test::weighted;
 
-std::unique_ptr<BoostingModel> load(const Forest& f, int32_t version = 4) {
-  const std::string text = writeModel(f, version);
-  ::testing::internal::CaptureStdout();
-  try {
-    auto model = std::make_unique<BoostingModel>(text);
-    ::testing::internal::GetCapturedStdout();
-    return model;
-  } catch (...) {
-    ::testing::internal::GetCapturedStdout();
-    throw;
-  }
+// A model from `text`, its version line on standard output discarded.
+std::unique_ptr<BoostingModel> load(const std::string& text) {
+  test::StdoutCapture discarded;  // ends with this function, however it ends
+  return std::make_unique<BoostingModel>(text);
 }
+
+std::unique_ptr<BoostingModel> load(const Forest& f, int32_t version = 4) { return load(writeModel(f, version)); }
 
 // Two features: position 0 is id 3, position 1 is id 17.
 Forest twoFeatureForest() {
@@ -46,13 +43,13 @@ Forest twoFeatureForest() {
 
 TEST(Construction, LogsOfAnEmptyForestAndItsScore) {
   LogCapture log;
-  ::testing::internal::CaptureStdout();
+  test::StdoutCapture out;
   Forest unknownVersion;  // written as version 2, then relabelled 5
   std::string text = writeModel(unknownVersion, 2);
   text = base64_encode(std::string("\x2c\xcb\x04\x00\x05\x00\x00\x00", 8)) +
          text.substr(text.find('\n'));
   BoostingModel model(text);
-  EXPECT_EQ(::testing::internal::GetCapturedStdout(), "Deseralization version: 5\n");
+  EXPECT_EQ(out.take(), "Deseralization version: 5\n");
 
   std::vector<std::string> all;
   for (const auto& e : log.entries()) all.push_back(e.text);
@@ -145,9 +142,10 @@ TEST(Failures, ReaderAndCompilerErrorsLeaveTheConstructor) {
   const std::string truncated =
       base64_encode(std::string("\x2c\xcb\x04\x00\x02\x00\x00\x00", 8)) + "\n" +
       base64_encode(std::string(8, '\0') + std::string("\x05\x00\x00\x00", 4)) + "\n";
-  ::testing::internal::CaptureStdout();
-  EXPECT_THROW(BoostingModel{truncated}, std::runtime_error);
-  ::testing::internal::GetCapturedStdout();
+  {
+    test::StdoutCapture discarded;
+    EXPECT_THROW(BoostingModel{truncated}, std::runtime_error);
+  }
 
   Forest wide = twoFeatureForest();
   wide.trees.push_back(weighted(split(40000, 0, leaf(0), leaf(1)), 1));
@@ -173,7 +171,7 @@ TEST(Failures, ReaderAndCompilerErrorsLeaveTheConstructor) {
 
 TEST(Concurrency, PredictFromSeveralThreads) {
   FLAGS_minloglevel = google::GLOG_WARNING;
-  Forest f = testing::randomForest(5, 64, 5, 20);
+  Forest f = test::randomForest(5, 64, 5, 20);
   auto model = load(f);
   FeatureMap x;
   for (int32_t id = 1; id <= 20; ++id) x.emplace(id, std::sin(id));
@@ -198,15 +196,13 @@ TEST(DeepModel, MillionLevelChainEndToEnd) {
   Forest f;
   f.inputKeys = {"depth"};
   f.featureMapping = {1};
-  f.trees.push_back(weighted(testing::chain(kDepth), 1));
-  f.modelSelector = weighted(testing::chain(1000), 1);
+  f.trees.push_back(weighted(test::chain(kDepth), 1));
+  f.modelSelector = weighted(test::chain(1000), 1);
   f.modelIndexMap = {1};
-  testing::runOnSmallStack([&] {
+  test::runOnSmallStack([&] {
     const std::string text = writeModel(f, 3);
     f = Forest();
-    ::testing::internal::CaptureStdout();
-    auto model = std::make_unique<BoostingModel>(text);
-    ::testing::internal::GetCapturedStdout();
+    auto model = load(text);
     // Selector leaf -1 selects model 0 (tree 0), which ends at leaf -1 too.
     EXPECT_EQ(model->rawScore({{1, 2e6}}), -1.0);
     EXPECT_EQ(model->rawScore({{1, 0.5}}), 0.0);  // selector leaf 1: model 1 is empty

@@ -8,26 +8,25 @@
 #include <limits>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
 
 namespace thornvale {
 namespace {
 
 using ::testing::HasSubstr;
-using testing::leaf;
-using testing::split;
-using testing::weighted;
+using test::leaf;
+using test::split;
+using test::weighted;
 
 std::unique_ptr<Forest> readBack(const std::string& text) {
-  ::testing::internal::CaptureStdout();
-  auto forest = deserialize(text);
-  ::testing::internal::GetCapturedStdout();
-  return forest;
+  test::StdoutCapture discarded;
+  return deserialize(text);
 }
 
 // A forest using every field, with awkward values: NaN with a payload,
 // negative zero, infinities, keys of every length modulo three, binary keys.
 Forest fullForest() {
-  Forest f = testing::randomForest(3, 5, 3, 6);
+  Forest f = test::randomForest(3, 5, 3, 6);
   f.baseScore = -0.0;
   uint64_t payload = 0x7FF0000000000123ull;
   double nan;
@@ -59,7 +58,7 @@ TEST(ModelWriter, RoundTripKeepsEveryFieldInEachVersion) {
     }
     auto back = readBack(text);
     std::string why;
-    EXPECT_TRUE(testing::sameForest(f, *back, &why)) << "version " << version << ": " << why;
+    EXPECT_TRUE(test::sameForest(f, *back, &why)) << "version " << version << ": " << why;
     EXPECT_EQ(writeModel(*back, version), text);
   }
 }

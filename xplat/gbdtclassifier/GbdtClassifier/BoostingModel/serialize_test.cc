@@ -8,13 +8,15 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
 
 namespace thornvale {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
-using testing::LogCapture;
+using test::LogCapture;
 
 // Little-endian record builder for hand-made model lines.
 struct Bytes {
@@ -54,15 +56,8 @@ struct Model {
 
 // Reads `text`, discarding the version line on standard output.
 std::unique_ptr<Forest> read(const std::string& text) {
-  ::testing::internal::CaptureStdout();
-  try {
-    auto forest = deserialize(text);
-    ::testing::internal::GetCapturedStdout();
-    return forest;
-  } catch (...) {
-    ::testing::internal::GetCapturedStdout();
-    throw;
-  }
+  test::StdoutCapture discarded;  // ends with this function, however it ends
+  return deserialize(text);
 }
 
 // A one-leaf tree line.
@@ -119,9 +114,9 @@ TEST(Header, VersionsAndMessages) {
   for (int32_t version : {1, 5}) {
     Model m = minimalV2();
     m.text = Model().header(version).text + m.text.substr(m.text.find('\n') + 1);
-    ::testing::internal::CaptureStdout();
+    test::StdoutCapture out;
     auto forest = deserialize(m.text);
-    EXPECT_EQ(::testing::internal::GetCapturedStdout(),
+    EXPECT_EQ(out.take(),
               "Deseralization version: " + std::to_string(version) + "\n");
     EXPECT_TRUE(forest->trees.empty());
     EXPECT_EQ(forest->baseScore, 0.0);
@@ -271,12 +266,12 @@ TEST(Malformed, CountsBeyondTheInputAreRefused) {
 
 TEST(Forests, CopiesAreDeepAndLinkingNamesByInputKeys) {
   Forest f;
-  f.trees.push_back(testing::weighted(testing::split(1, 0.5, testing::leaf(1), testing::leaf(2)), 2));
-  f.modelSelector = testing::weighted(testing::leaf(3), 1);
+  f.trees.push_back(test::weighted(test::split(1, 0.5, test::leaf(1), test::leaf(2)), 2));
+  f.modelSelector = test::weighted(test::leaf(3), 1);
   f.inputKeys = {"a", "b"};
   Forest copy = f;
   std::string why;
-  EXPECT_TRUE(testing::sameForest(f, copy, &why)) << why;
+  EXPECT_TRUE(test::sameForest(f, copy, &why)) << why;
   EXPECT_NE(copy.trees[0].tree.get(), f.trees[0].tree.get());
 
   linkForest(copy);

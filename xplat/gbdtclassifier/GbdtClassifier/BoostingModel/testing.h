@@ -1,7 +1,8 @@
 // Helpers for the engine's tests, benchmarks and sample generators: tree
-// builders, random forests, structural comparison of forests, a glog sink
-// that records messages, and a runner for code that must cope with a small
-// thread stack. Header-only; not part of the library.
+// builders, random forests, structural comparison of forests, and a runner
+// for code that must cope with a small thread stack (LogCapture.h records glog
+// messages, StdoutCapture.h standard output). Header-only; not part of the
+// library.
 #pragma once
 
 #include <glog/logging.h>
@@ -23,7 +24,7 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
 
-namespace thornvale::testing {
+namespace thornvale::test {
 
 inline std::unique_ptr<Node> leaf(double value) { return std::make_unique<ConstantNode>(value); }
 
@@ -179,52 +180,6 @@ inline bool sameForest(const Forest& a, const Forest& b, std::string* why) {
   return true;
 }
 
-// Records every glog message while alive, with INFO logging switched on.
-class LogCapture : public google::LogSink {
- public:
-  struct Entry {
-    google::LogSeverity severity;
-    std::string text;
-  };
-
-  LogCapture() : savedMinLevel_(FLAGS_minloglevel) {
-    FLAGS_minloglevel = google::GLOG_INFO;
-    google::AddLogSink(this);
-  }
-  ~LogCapture() override {
-    google::RemoveLogSink(this);
-    FLAGS_minloglevel = savedMinLevel_;
-  }
-
-  void send(google::LogSeverity severity, const char*, const char*, int,
-            const google::LogMessageTime&, const char* message, size_t length) override {
-    std::lock_guard<std::mutex> lock(mutex_);
-    entries_.push_back({severity, std::string(message, length)});
-  }
-
-  std::vector<Entry> entries() const {
-    std::lock_guard<std::mutex> lock(mutex_);
-    return entries_;
-  }
-  // Messages of one severity, in order.
-  std::vector<std::string> at(google::LogSeverity severity) const {
-    std::vector<std::string> out;
-    for (const Entry& e : entries()) {
-      if (e.severity == severity) out.push_back(e.text);
-    }
-    return out;
-  }
-  void clear() {
-    std::lock_guard<std::mutex> lock(mutex_);
-    entries_.clear();
-  }
-
- private:
-  int savedMinLevel_;
-  mutable std::mutex mutex_;
-  std::vector<Entry> entries_;
-};
-
 // Runs `body` on a thread whose stack is `stackBytes` long and rethrows what
 // it throws; code that recursed per tree level would overflow such a stack.
 inline void runOnSmallStack(const std::function<void()>& body, size_t stackBytes = 256 * 1024) {
@@ -254,4 +209,4 @@ inline void runOnSmallStack(const std::function<void()>& body, size_t stackBytes
   if (job.error) std::rethrow_exception(job.error);
 }
 
-}  // namespace thornvale::testing
+}  // namespace thornvale::test

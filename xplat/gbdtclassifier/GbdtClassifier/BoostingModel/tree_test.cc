@@ -8,19 +8,20 @@
 #include <sstream>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
 
 namespace thornvale {
 namespace {
 
-using testing::chain;
-using testing::leaf;
-using testing::split;
+using test::chain;
+using test::leaf;
+using test::split;
 
 const double kNaN = std::numeric_limits<double>::quiet_NaN();
 
 // f0 <= 1 ? 10 : (f1 <= 2 ? 20 : 30)
 std::unique_ptr<Tree> smallTree() {
-  return testing::tree(split(0, 1.0, leaf(10), split(1, 2.0, leaf(20), leaf(30))));
+  return test::tree(split(0, 1.0, leaf(10), split(1, 2.0, leaf(20), leaf(30))));
 }
 
 std::string rules(const Node& n) {
@@ -57,7 +58,7 @@ TEST(TreeRouting, SingleLeafTree) {
 TEST(TreeSweep, MatchesOneEvaluationPerValue) {
   std::mt19937_64 rng(7);
   for (int round = 0; round < 20; ++round) {
-    auto root = testing::randomFullTree(rng, 5, 3);
+    auto root = test::randomFullTree(rng, 5, 3);
     std::uniform_real_distribution<double> u(-1.5, 1.5);
     std::vector<double> features{u(rng), u(rng), u(rng)};
     std::vector<double> values;
@@ -102,17 +103,17 @@ TEST(TreePrinting, PrintTreeIndentsByDepthAndNamesFeatures) {
 }
 
 TEST(TreePrinting, PrintWritesOneLineDescriptions) {
-  ::testing::internal::CaptureStdout();
+  test::StdoutCapture out;
   leaf(0.5)->print();
   split(7, -2.25, leaf(0), leaf(1))->print();
-  EXPECT_EQ(::testing::internal::GetCapturedStdout(),
+  EXPECT_EQ(out.take(),
             "ConstantNode: value = 0.500000"
             "LinearNode: pivot index = 7, pivot value = -2.250000");
 }
 
 TEST(TreePrinting, RulesOrderedByValueWithAllBoundForms) {
   // f0 <= 1 ? 0.2 : (f0 <= 4 ? (f2 <= -3 ? 0.9 : 0.5) : 0.7)
-  auto t = testing::tree(split(0, 1.0, leaf(0.2),
+  auto t = test::tree(split(0, 1.0, leaf(0.2),
                                split(0, 4.0, split(2, -3.0, leaf(0.9), leaf(0.5)), leaf(0.7))));
   linkTree(*t, {"a", "b", "c"});
   EXPECT_EQ(rules(*t->root),
@@ -123,7 +124,7 @@ TEST(TreePrinting, RulesOrderedByValueWithAllBoundForms) {
 
   // Going left at 4 and then at 2 keeps the tighter upper bound; a right
   // branch at a zero or negative pivot still prints its lower bound.
-  auto u = testing::tree(
+  auto u = test::tree(
       split(0, 4.0, split(0, 2.0, leaf(1), leaf(2)), split(1, -0.5, leaf(3), leaf(4))));
   linkTree(*u, {});
   EXPECT_EQ(rules(*u->root), "4\t4 < 0; -0.5 < 1; \n3\t4 < 0; 1 <= -0.5; \n2\t2 < 0 <= 4; \n1\t0 <= 2; \n");
@@ -137,7 +138,7 @@ TEST(TreePrinting, RulesOfRootMatchRulesOfEachLeaf) {
   std::mt19937_64 rng(11);
   const double pivots[] = {kNaN, -kNaN, 0.0, -0.0, 1.0, -1.0, 0.5};
   for (int round = 0; round < 30; ++round) {
-    auto t = testing::tree(testing::randomFullTree(rng, 6, 2));
+    auto t = test::tree(test::randomFullTree(rng, 6, 2));
     std::vector<const Node*> leaves;
     t->root->collectLeaves(leaves);
     // Distinct leaf values make the order unambiguous; pivots from a small set
@@ -177,7 +178,7 @@ TEST(TreeCopies, CloneIsDeepIndependentAndUnlinked) {
   linkTree(*t, {"p", "q"});
   Tree copy(*t);
   std::string why;
-  EXPECT_TRUE(testing::sameNodes(t->root.get(), copy.root.get(), &why)) << why;
+  EXPECT_TRUE(test::sameNodes(t->root.get(), copy.root.get(), &why)) << why;
   EXPECT_NE(copy.root.get(), t->root.get());
   EXPECT_EQ(copy.root->tree, nullptr);
   EXPECT_EQ(copy.featureValues, t->featureValues);
@@ -190,8 +191,8 @@ TEST(TreeCopies, CloneIsDeepIndependentAndUnlinked) {
 // Every operation on a tree a million levels deep, on a 256 KiB stack.
 TEST(DeepTree, MillionLevelChainOnSmallStack) {
   constexpr size_t kDepth = 1000000;
-  testing::runOnSmallStack([] {
-    auto t = testing::tree(chain(kDepth));
+  test::runOnSmallStack([] {
+    auto t = test::tree(chain(kDepth));
     const std::vector<double> bottom{2e6};
     EXPECT_EQ(t->root->evaluate(bottom), -1.0);
     EXPECT_EQ(t->root->findLeaf({kDepth - 1.5})->evaluate({}), kDepth - 1.0);
@@ -220,8 +221,8 @@ TEST(DeepTree, MillionLevelChainOnSmallStack) {
 }
 
 TEST(DeepTree, PrintTreeOfDeepChainOnSmallStack) {
-  testing::runOnSmallStack([] {
-    auto t = testing::tree(chain(3000));
+  test::runOnSmallStack([] {
+    auto t = test::tree(chain(3000));
     std::ostringstream text;
     t->root->printTree(text, 0);
     const std::string all = text.str();
