@@ -21,7 +21,7 @@ ReliqasClassifier::~ReliqasClassifier() = default;
 
 ReliqaClassifierResult ReliqasClassifier::classify(const ReliqaClassifierInput& input) {
   FeatureMap features = extractFeatures(input);  // outside the lock: pure and reentrant
-  std::lock_guard<std::mutex> lock(mutex);
+  sync::MutexLock lock(mutex);
   // A server feature replaces the computed feature of its id. (Same content as
   // inserting the computed features into the server's map where absent, without
   // copying the computed ones.)
@@ -30,7 +30,7 @@ ReliqaClassifierResult ReliqasClassifier::classify(const ReliqaClassifierInput& 
 }
 
 void ReliqasClassifier::setModelParams(const ReliqaClassifierModelParams& params) {
-  std::lock_guard<std::mutex> lock(mutex);
+  sync::MutexLock lock(mutex);
   storeModelParams(modelParamsCache, params);
   if (!params.mSerializedModel.empty()) {
     // Read back from the store, not from `params`: the model in use is always
@@ -41,12 +41,12 @@ void ReliqasClassifier::setModelParams(const ReliqaClassifierModelParams& params
 }
 
 void ReliqasClassifier::setServerFeatures(const FeatureMap& features) {
-  std::lock_guard<std::mutex> lock(mutex);
+  sync::MutexLock lock(mutex);
   storeServerFeatures(serverFeaturesCache, features);
 }
 
 std::string ReliqasClassifier::currentlyUsedModelId() {
-  std::lock_guard<std::mutex> lock(mutex);
+  sync::MutexLock lock(mutex);
   return fetchModelId(modelParamsCache);
 }
 

@@ -17,9 +17,9 @@
 #pragma once
 
 #include <memory>
-#include <mutex>
 #include <string>
 
+#include "host/sync/Mutex.h"
 #include "reliqaclassifier/ReliqaClassifierInput.h"
 #include "reliqaclassifier/ReliqaClassifierResult.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/CacheManager.h"
@@ -51,10 +51,12 @@ class ReliqasClassifier {
   std::string currentlyUsedModelId();
 
  private:
-  std::mutex mutex;  // guards every use of the caches, the store and `model`
-  thornvale::CacheManager modelParamsCache;     // "model", "model_id", "threshold"
-  thornvale::CacheManager serverFeaturesCache;  // "server_features"
-  std::unique_ptr<thornvale::BoostingModel> model;  // null without a model
+  // Every use of the caches, of the store through them, and of `model` holds
+  // the mutex (checked by clang's -Wthread-safety).
+  sync::Mutex mutex;
+  thornvale::CacheManager modelParamsCache GUARDED_BY(mutex);     // "model", "model_id", "threshold"
+  thornvale::CacheManager serverFeaturesCache GUARDED_BY(mutex);  // "server_features"
+  std::unique_ptr<thornvale::BoostingModel> model GUARDED_BY(mutex);  // null without a model
 };
 
 }  // namespace kestrova::reliqaclassifier

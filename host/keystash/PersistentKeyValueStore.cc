@@ -7,10 +7,11 @@
 #include <unistd.h>
 
 #include <cstdint>
-#include <mutex>
 #include <stdexcept>
 #include <unordered_map>
 #include <utility>
+
+#include "host/sync/Mutex.h"
 
 namespace kestrova::mobile::xplat::keystash {
 namespace {
@@ -104,7 +105,7 @@ class PersistentKeyValueStore::Database {
   // read-only file, a writer holding it too long), the entry is read without
   // being kept.
   std::optional<Entry> fetch(const std::string& key) {
-    std::lock_guard<std::mutex> lock(mutex_);
+    sync::MutexLock lock(mutex_);
     if (!counter_) return read(key);
     if (counter_->load() != cachedChanges_ || cache_.size() >= kMaxCachedKeys) {
       cache_.clear();
@@ -136,7 +137,7 @@ class PersistentKeyValueStore::Database {
   // When nobody else wrote since memory was filled, memory stays valid with
   // this entry replaced.
   void store(const std::string& key, const FileUtils::BinaryData& value, const FileUtils::BinaryData& extra) {
-    std::lock_guard<std::mutex> lock(mutex_);
+    sync::MutexLock lock(mutex_);
     if (!counter_) {
       write(key, value, extra);
       return;
@@ -168,7 +169,7 @@ class PersistentKeyValueStore::Database {
   }
 
  private:
-  std::optional<Entry> read(const std::string& key) {
+  std::optional<Entry> read(const std::string& key) REQUIRES(mutex_) {
     Reset reset{select_};
     bindText(select_, 1, key);
     int rc = sqlite3_step(select_);
@@ -182,7 +183,8 @@ class PersistentKeyValueStore::Database {
     return entry;
   }
 
-  void write(const std::string& key, const FileUtils::BinaryData& value, const FileUtils::BinaryData& extra) {
+  void write(const std::string& key, const FileUtils::BinaryData& value, const FileUtils::BinaryData& extra)
+      REQUIRES(mutex_) {
     Reset reset{upsert_};
     bindText(upsert_, 1, key);
     bindBlob(upsert_, 2, value);
@@ -191,7 +193,7 @@ class PersistentKeyValueStore::Database {
   }
 
   // Runs a statement without result rows; false when SQLite refused it.
-  bool step(sqlite3_stmt* statement) {
+  bool step(sqlite3_stmt* statement) REQUIRES(mutex_) {
     Reset reset{statement};
     return sqlite3_step(statement) == SQLITE_DONE;
   }
@@ -254,10 +256,12 @@ class PersistentKeyValueStore::Database {
 
   std::string path_;
   std::unique_ptr<ChangeCounter> counter_;
-  std::mutex mutex_;
-  std::unordered_map<std::string, std::optional<Entry>> cache_;
+  // Guards the memory of entries and, by the REQUIRES of the functions that
+  // run statements, the connection (checked by clang's -Wthread-safety).
+  sync::Mutex mutex_;
+  std::unordered_map<std::string, std::optional<Entry>> cache_ GUARDED_BY(mutex_);
   static constexpr uint64_t kNotCached = UINT64_MAX;
-  uint64_t cachedChanges_ = kNotCached;  // counter value that cache_ is current for
+  uint64_t cachedChanges_ GUARDED_BY(mutex_) = kNotCached;  // counter value that cache_ is current for
   sqlite3* db_ = nullptr;
   sqlite3_stmt* select_ = nullptr;
   sqlite3_stmt* upsert_ = nullptr;
