@@ -9,7 +9,7 @@
 #include <random>
 #include <string>
 
-#include "host/keystash/PersistentKeyValueStore.h"
+#include "host/keystash/SqliteKeyValueStore.h"
 #include "host/keystash/TemporaryDirectory.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
@@ -20,7 +20,7 @@
 
 namespace {
 
-using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
+using kestrova::mobile::xplat::keystash::SqliteKeyValueStore;
 using kestrova::mobile::xplat::keystash::TemporaryDirectory;
 using namespace kestrova::reliqaclassifier;
 
@@ -67,7 +67,7 @@ BENCHMARK(BM_ExtractFeatures)->Arg(50)->Arg(1000);
 
 void BM_Classify50(benchmark::State& state) {
   TemporaryDirectory dir;
-  ReliqasClassifier classifier(std::make_shared<PersistentKeyValueStore>(dir.file("store.db")));
+  ReliqasClassifier classifier(std::make_shared<SqliteKeyValueStore>(dir.file("store.db")));
   classifier.setModelParams({benchmarkModel(), "bench-model", 0.5});
   classifier.setServerFeatures(kServerFeatures);
   const ReliqaClassifierInput input = collectionOf(50);

@@ -13,10 +13,10 @@
 #include <memory>
 #include <string>
 
-#include "host/keystash/PersistentKeyValueStore.h"
+#include "host/keystash/SqliteKeyValueStore.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 
-using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
+using kestrova::mobile::xplat::keystash::SqliteKeyValueStore;
 using namespace kestrova::reliqaclassifier;
 
 int main(int argc, char** argv) {
@@ -25,7 +25,7 @@ int main(int argc, char** argv) {
     return 1;
   }
   try {
-    ReliqasClassifier classifier(std::make_shared<PersistentKeyValueStore>(argv[1]));
+    ReliqasClassifier classifier(std::make_shared<SqliteKeyValueStore>(argv[1]));
     const std::string modelId = classifier.currentlyUsedModelId();
     const std::string score = classifier.classify(ReliqaClassifierInput{}).loggingData.at("score");
     int status = 0;

@@ -15,7 +15,9 @@
 #include <tuple>
 #include <vector>
 
-#include "host/keystash/FakePersistentKeyValueStore.h"
+#include "host/keystash/FaultInjectingKeyValueStore.h"
+#include "host/keystash/InMemoryKeyValueStore.h"
+#include "host/keystash/SqliteKeyValueStore.h"
 #include "host/keystash/PersistentKeyValueStore.h"
 #include "host/keystash/TemporaryDirectory.h"
 #include "reliqaclassifier/FeatureExtraction.h"
@@ -32,7 +34,9 @@ extern char** environ;
 namespace kestrova::reliqaclassifier {
 namespace {
 
-using kestrova::mobile::xplat::keystash::FakePersistentKeyValueStore;
+using kestrova::mobile::xplat::keystash::FaultInjectingKeyValueStore;
+using kestrova::mobile::xplat::keystash::InMemoryKeyValueStore;
+using kestrova::mobile::xplat::keystash::SqliteKeyValueStore;
 using kestrova::mobile::xplat::keystash::TemporaryDirectory;
 using test::rejectedModel;
 using test::stumpModel;
@@ -78,7 +82,8 @@ FeatureMap merged(const FeatureMap& server, const ReliqaClassifierInput& input) 
 
 class ReliqasClassifierTest : public ::testing::Test {
  protected:
-  std::shared_ptr<FakePersistentKeyValueStore> store = std::make_shared<FakePersistentKeyValueStore>();
+  std::shared_ptr<InMemoryKeyValueStore> memory = std::make_shared<InMemoryKeyValueStore>();
+  std::shared_ptr<FaultInjectingKeyValueStore> store = std::make_shared<FaultInjectingKeyValueStore>(memory);
   // Leaf -2 when feature 4 is at most 5, else +2.
   const std::string modelA = stumpModel(4, 5.0, -2.0, 2.0);
   const std::string modelB = stumpModel(4, 5.0, 1.0, -1.0);
@@ -124,7 +129,7 @@ TEST_F(ReliqasClassifierTest, ServerFeaturesReplaceComputedOnesAndAreReplacedAsA
   vector = featureVectorOf(classifier.classify(collection()));
   EXPECT_EQ(vector.at(4), 3.0);
   EXPECT_EQ(vector.count(1000), 0u);
-  EXPECT_EQ(store->peek("RELIQA_server_features"), "{\"2000\":1}");
+  EXPECT_EQ(memory->peek("RELIQA_server_features"), "{\"2000\":1}");
 }
 
 TEST_F(ReliqasClassifierTest, ModelIsKeptOnEmptyTextReplacedOnNewTextAndKeptWhenRejected) {
@@ -140,7 +145,7 @@ TEST_F(ReliqasClassifierTest, ModelIsKeptOnEmptyTextReplacedOnNewTextAndKeptWhen
   EXPECT_EQ(result.loggingData.at("model_id"), "b");
   EXPECT_EQ(result.loggingData.at("threshold"), "0.05");
   EXPECT_TRUE(result.isOverThreshold);
-  EXPECT_EQ(store->peek("RELIQA_model"), modelA);
+  EXPECT_EQ(memory->peek("RELIQA_model"), modelA);
 
   classifier.setModelParams({modelB, "c", 0.5});
   EXPECT_EQ(classifier.classify(collection()).score, scoreOf(modelB, features));
@@ -152,15 +157,15 @@ TEST_F(ReliqasClassifierTest, ModelIsKeptOnEmptyTextReplacedOnNewTextAndKeptWhen
   EXPECT_EQ(result.score, scoreOf(modelB, features));
   EXPECT_EQ(result.loggingData.at("model_id"), "d");
   EXPECT_EQ(result.loggingData.at("threshold"), "0.7");
-  EXPECT_EQ(store->peek("RELIQA_model"), rejectedModel());
+  EXPECT_EQ(memory->peek("RELIQA_model"), rejectedModel());
   EXPECT_THROW(ReliqasClassifier{store}, std::runtime_error);
 
   // A model that cannot be read back from the store leaves no model at all.
-  store->failFetches(FakePersistentKeyValueStore::Failure::kInGet);
+  store->failFetches(FaultInjectingKeyValueStore::Failure::kInGet);
   classifier.setModelParams({modelA, "e", 0.25});
-  store->failFetches(FakePersistentKeyValueStore::Failure::kNone);
+  store->failFetches(FaultInjectingKeyValueStore::Failure::kNone);
   EXPECT_EQ(classifier.classify(collection()).score, 1.0);
-  EXPECT_EQ(store->peek("RELIQA_model"), modelA);
+  EXPECT_EQ(memory->peek("RELIQA_model"), modelA);
   EXPECT_EQ(ReliqasClassifier(store).classify(collection()).score, scoreOf(modelA, features));
 }
 
@@ -169,8 +174,8 @@ TEST_F(ReliqasClassifierTest, CustomPrefixKeepsItsOwnEntries) {
   ReliqasClassifier second(store);
   first.setModelParams({modelA, "first", 0.5});
   EXPECT_EQ(second.currentlyUsedModelId(), "");
-  EXPECT_EQ(store->peek("FIRST_model_id"), "first");
-  EXPECT_EQ(store->peek("FIRST_threshold"), "0.5");
+  EXPECT_EQ(memory->peek("FIRST_model_id"), "first");
+  EXPECT_EQ(memory->peek("FIRST_threshold"), "0.5");
 }
 
 TEST_F(ReliqasClassifierTest, NonFiniteValuesFailTheCallAndLeaveTheClassifierUsable) {
@@ -185,8 +190,8 @@ TEST_F(ReliqasClassifierTest, NonFiniteValuesFailTheCallAndLeaveTheClassifierUsa
     EXPECT_STREQ(error.what(), "folly::toJson: JSON object value was a NaN when serializing <undefined location>");
   }
   EXPECT_EQ(classifier.currentlyUsedModelId(), "nan");
-  EXPECT_EQ(store->peek("RELIQA_threshold"), "0.5");
-  EXPECT_EQ(store->peek("RELIQA_model"), modelA);
+  EXPECT_EQ(memory->peek("RELIQA_threshold"), "0.5");
+  EXPECT_EQ(memory->peek("RELIQA_model"), modelA);
 
   ReliqaClassifierInput input = collection();
   input.assetDetails[1].latitude = std::numeric_limits<double>::quiet_NaN();
@@ -203,11 +208,11 @@ TEST_F(ReliqasClassifierTest, NonFiniteValuesFailTheCallAndLeaveTheClassifierUsa
 
 TEST_F(ReliqasClassifierTest, UndecodableStoredValuesThrowAndReleaseTheLock) {
   ReliqasClassifier classifier(store);
-  store->put("RELIQA_threshold", "seven");
+  memory->put("RELIQA_threshold", "seven");
   EXPECT_THROW(classifier.classify(collection()), thornvale::ConversionError);
   EXPECT_EQ(classifier.currentlyUsedModelId(), "");
-  store->put("RELIQA_threshold", "0.25");
-  store->put("RELIQA_server_features", "{\"4\":null}");
+  memory->put("RELIQA_threshold", "0.25");
+  memory->put("RELIQA_server_features", "{\"4\":null}");
   EXPECT_THROW(classifier.classify(collection()), thornvale::JsonTypeError);
   classifier.setServerFeatures({});
   EXPECT_EQ(classifier.classify(collection()).loggingData.at("threshold"), "0.25");
@@ -236,7 +241,7 @@ TEST_F(ReliqasClassifierTest, StoreFailuresOnlyLogAndUseDefaults) {
 
   ReliqasClassifier classifier(store);
   classifier.setModelParams({modelA, "a", 0.5});
-  store->failFetches(FakePersistentKeyValueStore::Failure::kInCall,
+  store->failFetches(FaultInjectingKeyValueStore::Failure::kInCall,
                      std::make_exception_ptr(std::runtime_error("database is locked")));
   result = classifier.classify(collection());
   EXPECT_EQ(result.score, scoreOf(modelA, merged({}, collection())));  // the loaded model still scores
@@ -247,20 +252,19 @@ TEST_F(ReliqasClassifierTest, StoreFailuresOnlyLogAndUseDefaults) {
 // Persistence through the SQLite store: a new classifier over the same file,
 // and a second process.
 TEST(ReliqasClassifierPersistenceTest, ParametersSurviveANewClassifierAndANewProcess) {
-  using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
   TemporaryDirectory dir;
   const std::string path = dir.file("store.db");
   const std::string model = stumpModel(4, 5.0, -2.0, 2.0);
   const ReliqaClassifierInput empty;
   std::string firstScore;
   {
-    ReliqasClassifier classifier(std::make_shared<PersistentKeyValueStore>(path));
+    ReliqasClassifier classifier(std::make_shared<SqliteKeyValueStore>(path));
     classifier.setModelParams({model, "parent", 0.25});
     classifier.setServerFeatures({{4, 9.0}});
     firstScore = classifier.classify(empty).loggingData.at("score");
   }
   {
-    ReliqasClassifier reopened(std::make_shared<PersistentKeyValueStore>(path));
+    ReliqasClassifier reopened(std::make_shared<SqliteKeyValueStore>(path));
     EXPECT_EQ(reopened.currentlyUsedModelId(), "parent");
     ReliqaClassifierResult result = reopened.classify(empty);
     EXPECT_EQ(result.loggingData.at("score"), firstScore);
@@ -284,7 +288,7 @@ TEST(ReliqasClassifierPersistenceTest, ParametersSurviveANewClassifierAndANewPro
   ASSERT_TRUE(WIFEXITED(status));
   ASSERT_EQ(WEXITSTATUS(status), 0) << "the helper process found other parameters";
 
-  ReliqasClassifier afterChild(std::make_shared<PersistentKeyValueStore>(path));
+  ReliqasClassifier afterChild(std::make_shared<SqliteKeyValueStore>(path));
   EXPECT_EQ(afterChild.currentlyUsedModelId(), "child");
   ReliqaClassifierResult result = afterChild.classify(empty);
   EXPECT_EQ(result.loggingData.at("threshold"), "0.75");
@@ -295,7 +299,6 @@ TEST(ReliqasClassifierPersistenceTest, ParametersSurviveANewClassifierAndANewPro
 // Classifications racing with updates: every result must be the answer for
 // some model-parameter state and some server-feature state that existed.
 TEST(ReliqasClassifierConcurrencyTest, ResultsMatchSomeStateThatExisted) {
-  using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
   const int savedLevel = FLAGS_minloglevel;
   FLAGS_minloglevel = google::GLOG_WARNING;  // no per-prediction INFO lines
 
@@ -331,7 +334,7 @@ TEST(ReliqasClassifierConcurrencyTest, ResultsMatchSomeStateThatExisted) {
     for (const Params& params : updates) {
       for (const FeatureMap& server : serverStates) {
         for (bool keepModel : {false, true}) {
-          auto reference = std::make_shared<FakePersistentKeyValueStore>();
+          auto reference = std::make_shared<InMemoryKeyValueStore>();
           ReliqasClassifier classifier(reference);
           classifier.setModelParams({model, "", 0.0});
           try {
@@ -353,7 +356,7 @@ TEST(ReliqasClassifierConcurrencyTest, ResultsMatchSomeStateThatExisted) {
   }
 
   TemporaryDirectory dir;
-  auto store = std::make_shared<PersistentKeyValueStore>(dir.file("store.db"));
+  auto store = std::make_shared<SqliteKeyValueStore>(dir.file("store.db"));
   ReliqasClassifier classifier(store);
   classifier.setModelParams({models[0], updates[0].id, updates[0].threshold});
   ReliqasClassifier sharingTheStore(store);  // keeps model 0, reads the same entries

@@ -6,6 +6,7 @@
 #include "host/jni/Exceptions.h"
 #include "host/jni/Lookup.h"
 #include "host/jni/Strings.h"
+#include "host/keystash/SqliteKeyValueStore.h"
 
 namespace kestrova::mobile::xplat::keystash {
 namespace {
@@ -19,7 +20,7 @@ jobject initHybrid(JNIEnv* env, jclass, jstring databasePath) {
     }
     std::string path = jni::JString(databasePath).toStdString();
     auto peer = std::make_unique<PersistentKeyValueStoreHybrid>(
-        std::make_shared<PersistentKeyValueStore>(path));
+        std::make_shared<SqliteKeyValueStore>(path));
     jni::LocalRef<jobject> hybridData = jni::detail::HybridData::create();
     jni::LocalRef<jobject> destructor = jni::detail::HybridData::getDestructor(hybridData.get());
     jni::detail::HybridData::setNativePointer(destructor.get(), std::move(peer));

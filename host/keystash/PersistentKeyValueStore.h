@@ -1,36 +1,23 @@
-// PersistentKeyValueStore: byte values under string keys, kept in an SQLite
-// database file so that they survive restarts and crashes of the process.
+// PersistentKeyValueStore: the host application's store of byte values under
+// string keys, as the classifier sees it. An interface; its implementations:
+//   SqliteKeyValueStore          the real one: an SQLite file that survives
+//                                restarts and crashes of the process;
+//   InMemoryKeyValueStore        the same behaviour, kept only in memory;
+//   FaultInjectingKeyValueStore  wraps any store and fails chosen calls.
 //
-// Contract:
-//   - fetch(key, option) yields the entry most recently stored under `key` (also
-//     by an earlier process, or by another store object over the same file), or
+// Contract of every implementation:
+//   - fetch(key, option) yields the entry most recently stored under `key`, or
 //     no entry when nothing was stored. `option` is accepted for compatibility
 //     and not used; pass std::nullopt.
 //   - store(key, value, extra) replaces the entry under `key` with `value` and
-//     `extra` (returned as Entry::extra). Once the returned future completes
-//     normally the write is atomic and durable: a reader never sees a torn value
-//     and a crash after completion does not lose it.
-//   - Both complete before they return; failures (an unreadable or read-only
-//     database, a full disk, a database locked by another process for more than
-//     five seconds) arrive as std::runtime_error from the future's get().
-//   - Reads are cheap: small entries are kept in memory and served from there
-//     until any store object over the file (in any process) begins a write,
-//     which it announces through a counter in the file "<databasePath>-changes"
-//     before it commits (so also a writer killed right after its commit has
-//     announced it). Write the database only through this class, and keep the
-//     two files together, or other live stores may go on serving what they had
-//     read. A read that has to go to the file waits for a write in progress.
-//
-// Thread-safety: any number of threads may call fetch and store at once; calls
-// on one object are serialised internally. Several objects, also in several
-// processes, may use one file.
-//
-// The constructor creates the file if needed and throws std::runtime_error when
-// the database cannot be opened or set up. fetch and store are virtual so that
-// tests can substitute a double (see FakePersistentKeyValueStore.h).
+//     `extra` (returned as Entry::extra). Once the returned future's get()
+//     returns normally, later fetches see the new entry.
+//   - Failures arrive as exceptions from the call or from the future's get();
+//     a store that fails leaves the entry as it was or replaced whole, never
+//     torn.
+//   - Any number of threads may call fetch and store at once.
 #pragma once
 
-#include <memory>
 #include <optional>
 #include <string>
 
@@ -46,24 +33,17 @@ class PersistentKeyValueStore {
     std::string extra;           // the `extra` bytes of the store call
   };
 
-  explicit PersistentKeyValueStore(const std::string& databasePath);
-  virtual ~PersistentKeyValueStore();
+  virtual ~PersistentKeyValueStore() = default;
 
-  PersistentKeyValueStore(const PersistentKeyValueStore&) = delete;
-  PersistentKeyValueStore& operator=(const PersistentKeyValueStore&) = delete;
-
-  virtual Future<std::optional<Entry>> fetch(const std::string& key, std::optional<std::string> option);
+  virtual Future<std::optional<Entry>> fetch(const std::string& key, std::optional<std::string> option) = 0;
 
   virtual Future<void> store(const std::string& key, const FileUtils::BinaryData& value,
-                             FileUtils::BinaryData&& extra);
+                             FileUtils::BinaryData&& extra) = 0;
 
  protected:
-  // For test doubles that override fetch and store: no database behind it.
-  PersistentKeyValueStore();
-
- private:
-  class Database;
-  std::unique_ptr<Database> database_;
+  PersistentKeyValueStore() = default;
+  PersistentKeyValueStore(const PersistentKeyValueStore&) = delete;
+  PersistentKeyValueStore& operator=(const PersistentKeyValueStore&) = delete;
 };
 
 }  // namespace kestrova::mobile::xplat::keystash

@@ -11,7 +11,7 @@
 #include <iostream>
 #include <memory>
 
-#include "host/keystash/PersistentKeyValueStore.h"
+#include "host/keystash/SqliteKeyValueStore.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ModelParamsPersistence.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
@@ -51,7 +51,7 @@ void makeParents(const std::string& path) {
 std::shared_ptr<PersistentKeyValueStore> openStore(const std::string& path) {
   makeParents(path);
   try {
-    return std::make_shared<PersistentKeyValueStore>(path);
+    return std::make_shared<kestrova::mobile::xplat::keystash::SqliteKeyValueStore>(path);
   } catch (const std::exception& e) {
     throw ToolError(path, 0, std::string("cannot open the store: ") + e.what());
   }

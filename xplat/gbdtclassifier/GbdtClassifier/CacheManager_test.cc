@@ -6,7 +6,8 @@
 #include <cmath>
 #include <limits>
 
-#include "host/keystash/FakePersistentKeyValueStore.h"
+#include "host/keystash/FaultInjectingKeyValueStore.h"
+#include "host/keystash/InMemoryKeyValueStore.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
@@ -14,15 +15,18 @@
 namespace thornvale {
 namespace {
 
-using kestrova::mobile::xplat::keystash::FakePersistentKeyValueStore;
+using kestrova::mobile::xplat::keystash::FaultInjectingKeyValueStore;
 using kestrova::mobile::xplat::keystash::FutureError;
-using Failure = FakePersistentKeyValueStore::Failure;
+using kestrova::mobile::xplat::keystash::InMemoryKeyValueStore;
+using Failure = FaultInjectingKeyValueStore::Failure;
 using ::testing::ElementsAre;
 using test::LogCapture;
 
 class CacheManagerTest : public ::testing::Test {
  protected:
-  std::shared_ptr<FakePersistentKeyValueStore> store = std::make_shared<FakePersistentKeyValueStore>();
+  // The cache's store: entries in memory, behind a wrapper that can fail calls.
+  std::shared_ptr<InMemoryKeyValueStore> memory = std::make_shared<InMemoryKeyValueStore>();
+  std::shared_ptr<FaultInjectingKeyValueStore> store = std::make_shared<FaultInjectingKeyValueStore>(memory);
   CacheManager cache{store, "RELIQA"};
   LogCapture log;
 };
@@ -34,10 +38,10 @@ TEST_F(CacheManagerTest, EncodesEachTypeUnderThePrefixedKey) {
   cache.store("one", 1.0);
   cache.store("model", std::string("line1\nline2\0\xff", 13));
   cache.store("server_features", FeatureMap{{4, 9.0}});
-  EXPECT_EQ(store->peek("RELIQA_threshold"), "0.5");
-  EXPECT_EQ(store->peek("RELIQA_one"), "1");
-  EXPECT_EQ(store->peek("RELIQA_model"), std::string("line1\nline2\0\xff", 13));
-  EXPECT_EQ(store->peek("RELIQA_server_features"), "{\"4\":9}");
+  EXPECT_EQ(memory->peek("RELIQA_threshold"), "0.5");
+  EXPECT_EQ(memory->peek("RELIQA_one"), "1");
+  EXPECT_EQ(memory->peek("RELIQA_model"), std::string("line1\nline2\0\xff", 13));
+  EXPECT_EQ(memory->peek("RELIQA_server_features"), "{\"4\":9}");
 
   EXPECT_EQ(cache.fetch("threshold", 0.0), 0.5);
   EXPECT_EQ(cache.fetch("model", ""), std::string("line1\nline2\0\xff", 13));
@@ -51,13 +55,13 @@ TEST_F(CacheManagerTest, EncodesEachTypeUnderThePrefixedKey) {
 }
 
 TEST_F(CacheManagerTest, UndecodableValuesThrowInsteadOfDefaultingAndLogNothing) {
-  store->put("RELIQA_threshold", "abc");
+  memory->put("RELIQA_threshold", "abc");
   EXPECT_THROW(cache.fetch("threshold", 0.0), ConversionError);
-  store->put("RELIQA_threshold", " 0.7\n");
+  memory->put("RELIQA_threshold", " 0.7\n");
   EXPECT_EQ(cache.fetch("threshold", 0.0), 0.7);
-  store->put("RELIQA_server_features", "[1]");
+  memory->put("RELIQA_server_features", "[1]");
   EXPECT_THROW(cache.fetch("server_features", FeatureMap{}), JsonTypeError);
-  store->put("RELIQA_server_features", "{\"4\":");
+  memory->put("RELIQA_server_features", "{\"4\":");
   EXPECT_THROW(cache.fetch("server_features", FeatureMap{}), JsonParseError);
   EXPECT_TRUE(log.entries().empty());
 }
@@ -69,7 +73,7 @@ TEST_F(CacheManagerTest, NonFiniteNumbersAreRefusedBeforeTheStoreIsCalled) {
   EXPECT_THROW(cache.store("server_features", FeatureMap{{1, -std::numeric_limits<double>::infinity()}}),
                JsonPrintError);
   EXPECT_EQ(store->storeCount(), stores);
-  EXPECT_EQ(store->peek("RELIQA_threshold"), "0.5");
+  EXPECT_EQ(memory->peek("RELIQA_threshold"), "0.5");
 }
 
 TEST_F(CacheManagerTest, WithoutAStoreEveryCallLogsAndDefaults) {
@@ -87,7 +91,7 @@ TEST_F(CacheManagerTest, WithoutAStoreEveryCallLogsAndDefaults) {
 }
 
 TEST_F(CacheManagerTest, StoreFailuresAreLoggedAndAbsorbedWhereverTheyArise) {
-  store->put("RELIQA_threshold", "0.5");
+  memory->put("RELIQA_threshold", "0.5");
   for (Failure where : {Failure::kInCall, Failure::kInGet}) {
     store->failFetches(where, std::make_exception_ptr(std::runtime_error("disk gone")));
     store->failStores(where, std::make_exception_ptr(FutureError(FutureError::kNoValueSource)));

@@ -18,4 +18,4 @@ reliqa_test(reliqa_json_test
 
 reliqa_test(reliqa_cache_test
   SOURCES ${CMAKE_CURRENT_LIST_DIR}/CacheManager_test.cc
-  LIBS reliqa_cache keystash_fake glog::glog)
+  LIBS reliqa_cache keystash glog::glog)

@@ -1,4 +1,4 @@
-#include "host/keystash/PersistentKeyValueStore.h"
+#include "host/keystash/SqliteKeyValueStore.h"
 
 #include <gtest/gtest.h>
 #include <signal.h>
@@ -27,9 +27,9 @@ void write(PersistentKeyValueStore& store, const std::string& key, const std::st
   store.store(key, BinaryData(value), BinaryData()).get();
 }
 
-TEST(PersistentKeyValueStoreTest, StoresBytesExactlyAndLastWriteWins) {
+TEST(SqliteKeyValueStore, StoresBytesExactlyAndLastWriteWins) {
   TemporaryDirectory dir;
-  PersistentKeyValueStore store(dir.file("kv.db"));
+  SqliteKeyValueStore store(dir.file("kv.db"));
   EXPECT_EQ(read(store, "absent"), std::nullopt);
 
   const std::string binary("line\n\0\xff\xc3\xa9 end", 12);
@@ -47,20 +47,20 @@ TEST(PersistentKeyValueStoreTest, StoresBytesExactlyAndLastWriteWins) {
   EXPECT_EQ(read(store, std::string("k\0", 2)), std::nullopt);  // keys are byte strings too
 }
 
-TEST(PersistentKeyValueStoreTest, ValuesSurviveNewObjectsAndAKilledProcess) {
+TEST(SqliteKeyValueStore, ValuesSurviveNewObjectsAndAKilledProcess) {
   TemporaryDirectory dir;
   const std::string path = dir.file("kv.db");
   {
-    PersistentKeyValueStore store(path);
+    SqliteKeyValueStore store(path);
     write(store, "before", "1");
   }
-  PersistentKeyValueStore parentStore(path);
+  SqliteKeyValueStore parentStore(path);
   EXPECT_EQ(read(parentStore, "before"), "1");  // now kept in memory
   pid_t child = fork();
   ASSERT_GE(child, 0);
   if (child == 0) {
     // The write has completed when get() returns; die without any clean-up.
-    PersistentKeyValueStore store(path);
+    SqliteKeyValueStore store(path);
     write(store, "from-child", "written then killed");
     write(store, "before", "2");
     raise(SIGKILL);
@@ -71,15 +71,15 @@ TEST(PersistentKeyValueStoreTest, ValuesSurviveNewObjectsAndAKilledProcess) {
   ASSERT_TRUE(WIFSIGNALED(status));
 
   EXPECT_EQ(read(parentStore, "before"), "2");  // a live store sees the other process's write
-  PersistentKeyValueStore reopened(path);
+  SqliteKeyValueStore reopened(path);
   EXPECT_EQ(read(reopened, "before"), "2");
   EXPECT_EQ(read(reopened, "from-child"), "written then killed");
 }
 
-TEST(PersistentKeyValueStoreTest, StoresOverOneFileSeeEachOthersWrites) {
+TEST(SqliteKeyValueStore, StoresOverOneFileSeeEachOthersWrites) {
   TemporaryDirectory dir;
-  PersistentKeyValueStore first(dir.file("kv.db"));
-  PersistentKeyValueStore second(dir.file("kv.db"));
+  SqliteKeyValueStore first(dir.file("kv.db"));
+  SqliteKeyValueStore second(dir.file("kv.db"));
   EXPECT_EQ(read(second, "k"), std::nullopt);
   write(first, "k", "1");
   EXPECT_EQ(read(second, "k"), "1");
@@ -95,10 +95,10 @@ TEST(PersistentKeyValueStoreTest, StoresOverOneFileSeeEachOthersWrites) {
 // Reads from one store race with writes through another: once a write has
 // returned, no read may still give an older value, whatever the reader had
 // put in memory while the write was in progress.
-TEST(PersistentKeyValueStoreTest, NoReadAfterAWriteReturnsAnOlderValue) {
+TEST(SqliteKeyValueStore, NoReadAfterAWriteReturnsAnOlderValue) {
   TemporaryDirectory dir;
-  PersistentKeyValueStore writer(dir.file("kv.db"));
-  PersistentKeyValueStore reader(dir.file("kv.db"));
+  SqliteKeyValueStore writer(dir.file("kv.db"));
+  SqliteKeyValueStore reader(dir.file("kv.db"));
   write(writer, "k", "0");
   constexpr int kWrites = 200;
   std::atomic<int> written{0};
@@ -119,10 +119,10 @@ TEST(PersistentKeyValueStoreTest, NoReadAfterAWriteReturnsAnOlderValue) {
   EXPECT_EQ(read(reader, "k"), std::to_string(kWrites));
 }
 
-TEST(PersistentKeyValueStoreTest, ConcurrentWritersNeverTearAValue) {
+TEST(SqliteKeyValueStore, ConcurrentWritersNeverTearAValue) {
   TemporaryDirectory dir;
-  PersistentKeyValueStore first(dir.file("kv.db"));
-  PersistentKeyValueStore second(dir.file("kv.db"));  // another connection to the same file
+  SqliteKeyValueStore first(dir.file("kv.db"));
+  SqliteKeyValueStore second(dir.file("kv.db"));  // another connection to the same file
   std::atomic<bool> torn{false};
   std::vector<std::thread> threads;
   for (int t = 0; t < 4; ++t) {
@@ -144,10 +144,10 @@ TEST(PersistentKeyValueStoreTest, ConcurrentWritersNeverTearAValue) {
   EXPECT_FALSE(torn);
 }
 
-TEST(PersistentKeyValueStoreTest, UnopenableDatabaseThrowsWithThePath) {
+TEST(SqliteKeyValueStore, UnopenableDatabaseThrowsWithThePath) {
   TemporaryDirectory dir;
   try {
-    PersistentKeyValueStore store(dir.file("missing/dir/kv.db"));
+    SqliteKeyValueStore store(dir.file("missing/dir/kv.db"));
     FAIL() << "expected an exception";
   } catch (const std::runtime_error& error) {
     EXPECT_NE(std::string(error.what()).find("missing/dir/kv.db"), std::string::npos) << error.what();

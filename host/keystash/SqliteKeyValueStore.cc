@@ -1,4 +1,4 @@
-#include "host/keystash/PersistentKeyValueStore.h"
+#include "host/keystash/SqliteKeyValueStore.h"
 
 #include <fcntl.h>
 #include <sqlite3.h>
@@ -64,7 +64,7 @@ bool cacheable(const std::optional<PersistentKeyValueStore::Entry>& entry) {
 }  // namespace
 
 // One SQLite connection with its prepared statements, used under `mutex`.
-class PersistentKeyValueStore::Database {
+class SqliteKeyValueStore::Database {
  public:
   explicit Database(const std::string& path) : path_(path), counter_(ChangeCounter::open(path + "-changes")) {
     int rc = sqlite3_open_v2(path.c_str(), &db_,
@@ -270,19 +270,16 @@ class PersistentKeyValueStore::Database {
   sqlite3_stmt* rollback_ = nullptr;
 };
 
-PersistentKeyValueStore::PersistentKeyValueStore(const std::string& databasePath)
+SqliteKeyValueStore::SqliteKeyValueStore(const std::string& databasePath)
     : database_(std::make_unique<Database>(databasePath)) {}
 
-PersistentKeyValueStore::PersistentKeyValueStore() = default;
+SqliteKeyValueStore::~SqliteKeyValueStore() = default;
 
-PersistentKeyValueStore::~PersistentKeyValueStore() = default;
-
-Future<std::optional<PersistentKeyValueStore::Entry>> PersistentKeyValueStore::fetch(
+Future<std::optional<PersistentKeyValueStore::Entry>> SqliteKeyValueStore::fetch(
     const std::string& key, std::optional<std::string> /*option*/) {
   Promise<std::optional<Entry>> promise;
   auto future = promise.getFuture();
   try {
-    if (!database_) throw std::logic_error("key-value store has no database");
     promise.setValue(database_->fetch(key));
   } catch (const std::exception&) {
     promise.setException(std::current_exception());
@@ -290,12 +287,11 @@ Future<std::optional<PersistentKeyValueStore::Entry>> PersistentKeyValueStore::f
   return future;
 }
 
-Future<void> PersistentKeyValueStore::store(const std::string& key, const FileUtils::BinaryData& value,
-                                            FileUtils::BinaryData&& extra) {
+Future<void> SqliteKeyValueStore::store(const std::string& key, const FileUtils::BinaryData& value,
+                                        FileUtils::BinaryData&& extra) {
   Promise<void> promise;
   auto future = promise.getFuture();
   try {
-    if (!database_) throw std::logic_error("key-value store has no database");
     database_->store(key, value, extra);
     promise.setValue();
   } catch (const std::exception&) {
