@@ -133,7 +133,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     checkLength(features);
     const float* x = features.data();
     const auto [first, end] = selectModel(x);
-    if (kernel_ != WalkKernel::kPortable && !gatherRoot_.empty()) {
+    if (kernel_ != WalkKernel::kPortable && !walk_.empty()) {
       return sumGathered(x, first, end);
     }
     return sumInterleaved(x, first, end);
@@ -167,10 +167,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     return true;
   }
   // Bytes held by the copy of the nodes that the gather kernels walk.
-  size_t gatherBytes() const {
-    return (gatherNodes_.size() + gatherRootNode_.size()) * sizeof(WalkNode) +
-           (gatherRoot_.size() + gatherDepth_.size()) * sizeof(uint32_t);
-  }
+  size_t gatherBytes() const { return walk_.bytes(); }
 
   // The range [first, end) of trees that the selector chooses for `features`.
   std::pair<size_t, size_t> selectModel(const std::vector<float>& features) const {
@@ -365,11 +362,11 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
       // Lanes past `end` walk the trees (or padding) that follow, unused.
       const size_t n = std::min(kWalkGroup, end - i);
       uint32_t rounds = 1;
-      for (size_t k = 0; k < n; ++k) rounds = std::max(rounds, gatherDepth_[i + k]);
-      walkGroup(kernel_, gatherNodes_.data(), gatherRoot_.data() + i, gatherRootNode_.data() + i,
+      for (size_t k = 0; k < n; ++k) rounds = std::max(rounds, walk_.depths[i + k]);
+      walkGroup(kernel_, walk_.nodes.data(), walk_.roots.data() + i, walk_.rootNodes.data() + i,
                 rounds, x, slots, leaves);
       for (size_t k = 0; k < n; ++k) {
-        const float v = gatherDepth_[i + k] != 0 ? leaves[k] : leafValue(trees_[i + k], features);
+        const float v = walk_.depths[i + k] != 0 ? leaves[k] : leafValue(trees_[i + k], features);
         sum += static_cast<double>(v);
       }
     }
@@ -384,17 +381,9 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   std::vector<uint32_t> featureMapping_;
   bool remap_ = false;
   size_t requiredFeatures_ = 0;
-  // The plain trees again, for the gather kernels (see FastTreeEnsembleSimd.h):
-  // the constant tree (value 0) at index 0, then one tree after another.
-  // gatherRoot_[i] is the index of tree i's root (0 for a tree that the
-  // kernels do not take), gatherRootNode_[i] a copy of that node, both
-  // followed by kWalkGroup entries of the constant tree; gatherDepth_[i] is
-  // tree i's number of steps (0 for a tree that the kernels do not take).
-  // All empty when the kernels cannot be used for this forest.
-  std::vector<WalkNode> gatherNodes_;
-  std::vector<uint32_t> gatherRoot_;
-  std::vector<WalkNode> gatherRootNode_;
-  std::vector<uint32_t> gatherDepth_;
+  // The plain trees again, for the gather kernels (FastTreeEnsembleSimd.h);
+  // empty when the kernels cannot be used for this forest.
+  WalkForest walk_;
   WalkKernel kernel_ = bestWalkKernel();
 };
 
@@ -402,10 +391,7 @@ template <typename FeatureIdT, typename NodeIndexT>
 bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, bool remap) {
   if (forest == nullptr) return false;
   trees_.clear();
-  gatherNodes_.clear();
-  gatherRoot_.clear();
-  gatherRootNode_.clear();
-  gatherDepth_.clear();
+  walk_ = WalkForest{};
   baseScore_ = forest->baseScore;
   featureMapping_ = forest->featureMapping;
   requiredFeatures_ = 0;
@@ -452,54 +438,8 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::gatherable(const FlatTree& tre
 
 template <typename FeatureIdT, typename NodeIndexT>
 void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildGatherNodes() {
-  if (trees_.empty() || requiredFeatures_ > kMaxGatherFeatures) return;
-  // Node indices must stay below 2^31: the gathers take signed indices.
-  uint64_t count = 3;
-  for (const FlatTree& t : trees_) {
-    if (gatherable(t)) count += t.nodes.size() + 2;
-  }
-  if (count > uint64_t{std::numeric_limits<int32_t>::max()}) return;
-
-  const auto nanSlot = static_cast<uint32_t>(requiredFeatures_);
-  std::vector<WalkNode> nodes;
-  nodes.reserve(count);
-  // A root on the NaN slot goes to its second child; both children are the leaf.
-  auto constantTree = [&](float value) {
-    nodes.push_back(walkNode(nanSlot, 1, 0.0f));
-    nodes.push_back(walkNode(nanSlot, 0, value));
-    nodes.push_back(walkNode(nanSlot, 0, value));
-  };
-  constantTree(0.0f);
-  gatherRoot_.assign(trees_.size() + kWalkGroup, 0);
-  gatherDepth_.assign(trees_.size(), 0);
-  bool any = false;
-  for (size_t i = 0; i < trees_.size(); ++i) {
-    const FlatTree& t = trees_[i];
-    if (!gatherable(t)) continue;
-    any = true;
-    gatherRoot_[i] = static_cast<uint32_t>(nodes.size());
-    if (t.nodes[0].featureId == kLeaf) {
-      constantTree(t.nodes[0].value);
-      gatherDepth_[i] = 1;
-      continue;
-    }
-    gatherDepth_[i] = t.depth;
-    for (size_t j = 0; j < t.nodes.size(); ++j) {
-      const FlatNode& n = t.nodes[j];
-      nodes.push_back(n.featureId == kLeaf
-                          ? walkNode(nanSlot, 0, n.value)
-                          : walkNode(static_cast<uint32_t>(n.featureId),
-                                     static_cast<uint32_t>(n.child - j), n.value));
-    }
-  }
-  if (!any) {
-    gatherRoot_.clear();
-    gatherDepth_.clear();
-    return;
-  }
-  gatherRootNode_.reserve(gatherRoot_.size());
-  for (uint32_t root : gatherRoot_) gatherRootNode_.push_back(nodes[root]);
-  gatherNodes_ = std::move(nodes);
+  if (requiredFeatures_ > kMaxGatherFeatures) return;
+  walk_ = buildWalkForest(trees_, kLeaf, static_cast<uint32_t>(requiredFeatures_), gatherable);
 }
 
 template <typename FeatureIdT, typename NodeIndexT>

@@ -1,4 +1,6 @@
-// Kernels that walk a group of compiled trees at once, in lock step.
+// Kernels that walk a group of compiled trees at once, in lock step, the
+// format of the nodes they walk, and buildWalkForest(), which lays compiled
+// trees out in that format.
 //
 // The trees to walk live in one array of 8-byte WalkNode, so that a single
 // gather base serves every lane and one 64-bit load brings a whole node; a
@@ -27,6 +29,8 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <limits>
+#include <vector>
 
 namespace thornvale {
 
@@ -55,6 +59,75 @@ enum class WalkKernel {
 
 // Trees walked per call of walkGroup().
 constexpr size_t kWalkGroup = 128;
+
+// The trees of a forest as the kernels walk them: the constant tree (value 0)
+// at index 0 of `nodes`, then one tree after another. roots[i] is the index of
+// tree i's root (0 for a tree that the kernels do not take), rootNodes[i] a
+// copy of that node, both followed by kWalkGroup entries of the constant tree;
+// depths[i] is tree i's number of steps (0 for a tree that the kernels do not
+// take). All empty when the kernels take no tree.
+struct WalkForest {
+  std::vector<WalkNode> nodes;
+  std::vector<uint32_t> roots;
+  std::vector<WalkNode> rootNodes;
+  std::vector<uint32_t> depths;
+
+  bool empty() const { return roots.empty(); }
+  size_t bytes() const {
+    return (nodes.size() + rootNodes.size()) * sizeof(WalkNode) + (roots.size() + depths.size()) * sizeof(uint32_t);
+  }
+};
+
+// Builds the walk nodes of compiled trees. A Tree has `nodes` (root first, the
+// two children of a split adjacent, each node with `featureId`, `child` (index
+// of its first child) and `value`, a leaf marked by featureId == leafId) and
+// `depth`; `takes(tree)` says whether the kernels walk it. `nanSlot` is the
+// feature position that always holds NaN. Returns an empty forest when no tree
+// is taken or the nodes would not fit signed 32-bit indices (the gathers take
+// signed indices).
+template <typename Tree, typename Takes>
+WalkForest buildWalkForest(const std::vector<Tree>& trees, int64_t leafId, uint32_t nanSlot, Takes takes) {
+  WalkForest out;
+  uint64_t count = 3;
+  for (const Tree& t : trees) {
+    if (takes(t)) count += t.nodes.size() + 2;
+  }
+  if (trees.empty() || count > uint64_t{std::numeric_limits<int32_t>::max()}) return out;
+  std::vector<WalkNode>& nodes = out.nodes;
+  nodes.reserve(count);
+  // A root on the NaN slot goes to its second child; both children are the leaf.
+  auto constantTree = [&](float value) {
+    nodes.push_back(walkNode(nanSlot, 1, 0.0f));
+    nodes.push_back(walkNode(nanSlot, 0, value));
+    nodes.push_back(walkNode(nanSlot, 0, value));
+  };
+  constantTree(0.0f);
+  out.roots.assign(trees.size() + kWalkGroup, 0);
+  out.depths.assign(trees.size(), 0);
+  bool any = false;
+  for (size_t i = 0; i < trees.size(); ++i) {
+    const Tree& t = trees[i];
+    if (!takes(t)) continue;
+    any = true;
+    out.roots[i] = static_cast<uint32_t>(nodes.size());
+    if (t.nodes[0].featureId == leafId) {
+      constantTree(t.nodes[0].value);
+      out.depths[i] = 1;
+      continue;
+    }
+    out.depths[i] = t.depth;
+    for (size_t j = 0; j < t.nodes.size(); ++j) {
+      const auto& n = t.nodes[j];
+      nodes.push_back(n.featureId == leafId ? walkNode(nanSlot, 0, n.value)
+                                            : walkNode(static_cast<uint32_t>(n.featureId),
+                                                       static_cast<uint32_t>(n.child - j), n.value));
+    }
+  }
+  if (!any) return WalkForest{};
+  out.rootNodes.reserve(out.roots.size());
+  for (uint32_t root : out.roots) out.rootNodes.push_back(nodes[root]);
+  return out;
+}
 
 // Whether this CPU (and build) can run `kernel`.
 bool walkKernelSupported(WalkKernel kernel);
