@@ -135,6 +135,11 @@ TEST(CollectionReader, BothPassesReadTheSameBits) {
       with("\"longitude\": -9.1", "\"longitude\": 2.2250738585072011e-308"),
       with("\"creationDateSinceEpoch\": 4102444800", "\"creationDateSinceEpoch\": -0"),
       with("\"assetID\": \"a1\"", "\"assetID\": \"\\u00e9\\n\\\"\""),
+      // Twenty digits or more in a row: simdjson's On-Demand reader gets such
+      // numbers wrong, so the careful pass reads them itself.
+      with("\"latitude\": 38.7", "\"latitude\": -0.25000000000000000000"),
+      with("\"timeSinceStory\": 12.5", "\"timeSinceStory\": 1e-99999999999999999999"),
+      with("\"timeSinceStory\": 12.5", "\"timeSinceStory\": 1e-0000000000000000000000001"),
   };
   CollectionReader reader;
   for (const std::string& text : texts) {
@@ -147,6 +152,11 @@ TEST(CollectionReader, BothPassesReadTheSameBits) {
     reader.read(text, "f.json", 1, read);
     EXPECT_EQ(test::recordDifference(read, careful), "") << text;
   }
+  kestrova::reliqaclassifier::ReliqaClassifierInput longDigits;
+  reader.read(texts[11], "f.json", 1, longDigits);
+  EXPECT_EQ(longDigits.assetDetails[0].latitude, -0.25);
+  reader.read(texts[13], "f.json", 1, longDigits);
+  EXPECT_EQ(longDigits.timeSinceStory, 0.1);
   // The quick pass does its work on ordinary text.
   kestrova::reliqaclassifier::ReliqaClassifierInput out;
   EXPECT_TRUE(reader.readQuickly(texts[0], out));

@@ -59,7 +59,9 @@ struct MemberPath {
 class MemberNames {
  public:
   template <size_t N>
-  constexpr MemberNames(const std::string_view (&names)[N]) : names_(names), size_(N) {}  // NOLINT: implicit
+  constexpr MemberNames(const std::string_view (&names)[N]) : names_(names), size_(N) {  // NOLINT: implicit
+    static_assert(N <= 32, "readers keep the members seen in a 32-bit mask");
+  }
   constexpr const std::string_view* begin() const { return names_; }
   constexpr const std::string_view* end() const { return names_ + size_; }
   constexpr size_t size() const { return size_; }

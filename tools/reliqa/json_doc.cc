@@ -1,8 +1,10 @@
 #include "tools/reliqa/json_doc.h"
 
 #include <algorithm>
+#include <cmath>
 #include <vector>
 
+#include "reliqaclassifier/ServerFeatureText.h"
 #include "tools/reliqa/errors.h"
 
 namespace reliqa::tool {
@@ -165,9 +167,71 @@ simdjson::ondemand::array JsonDoc::getArray(simdjson::ondemand::value& v, const 
   return take(v.get_array(), path);
 }
 
+namespace {
+
+std::string_view trimmedToken(simdjson::ondemand::value& v) {
+  std::string_view token = v.raw_json_token();
+  while (!token.empty() && (token.back() == ' ' || token.back() == '\n' || token.back() == '\r' ||
+                            token.back() == '\t')) {
+    token.remove_suffix(1);
+  }
+  return token;
+}
+
+bool isDigit(char c) { return c >= '0' && c <= '9'; }
+
+// Twenty or more digits in a row, in the mantissa or the exponent.
+bool hasLongDigitRun(std::string_view token) {
+  size_t run = 0;
+  for (char c : token) {
+    run = isDigit(c) ? run + 1 : 0;
+    if (run >= 20) return true;
+  }
+  return false;
+}
+
+// The JSON number grammar: -?(0|[1-9][0-9]*)(\.[0-9]+)?([eE][+-]?[0-9]+)?
+bool isJsonNumber(std::string_view t) {
+  size_t i = 0;
+  auto digits = [&] {
+    size_t start = i;
+    while (i < t.size() && isDigit(t[i])) ++i;
+    return i > start;
+  };
+  if (i < t.size() && t[i] == '-') ++i;
+  if (i < t.size() && t[i] == '0') {
+    ++i;
+  } else if (!digits()) {
+    return false;
+  }
+  if (i < t.size() && t[i] == '.') {
+    ++i;
+    if (!digits()) return false;
+  }
+  if (i < t.size() && (t[i] == 'e' || t[i] == 'E')) {
+    ++i;
+    if (i < t.size() && (t[i] == '+' || t[i] == '-')) ++i;
+    if (!digits()) return false;
+  }
+  return i == t.size();
+}
+
+}  // namespace
+
 double JsonDoc::getDouble(simdjson::ondemand::value& v, const std::string& path) {
   json_type t = typeOf(*this, v, path);
   if (t != json_type::number) fail(v, where(path) + "expected a number, got " + typeWord(t));
+  const std::string_view token = trimmedToken(v);
+  if (hasLongDigitRun(token)) {
+    // simdjson's On-Demand reader misreads such numbers (0.25000000000000000000
+    // comes out as -0.0655...) and refuses long exponents that its DOM reader
+    // takes; they are read here instead, correctly rounded.
+    if (isJsonNumber(token)) {
+      double exact = kestrova::reliqaclassifier::parseFeatureValue(std::string(token));
+      if (std::isfinite(exact)) return exact;
+    }
+    fail(v, where(path) + "malformed number " + quoteForMessage(token));
+  }
   double d;
   if (auto err = v.get_double().get(d)) {
     if (err == simdjson::NUMBER_ERROR || err == simdjson::INCORRECT_TYPE) {
