@@ -16,11 +16,12 @@ inline std::string cpuFlags() {
     std::istringstream words(line.substr(line.find(':') + 1));
     std::string out, w;
     while (words >> w) {
-      if (w == "avx2" || w == "avx512f" || w == "fma" || w == "sse4_2" || w == "bmi2" || w == "asimd") {
+      if (w == "avx2" || w == "avx512f" || w == "fma" || w == "sse4_2" || w == "bmi2" || w == "asimd" ||
+          w == "neon") {
         out += (out.empty() ? "" : " ") + w;
       }
     }
-    return out.empty() ? "none of avx512f avx2 fma sse4_2 bmi2 asimd" : out;
+    return out.empty() ? "none of avx512f avx2 fma sse4_2 bmi2 asimd neon" : out;
   }
   return "unknown";
 }

@@ -15,6 +15,8 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <cstdlib>
 #include <fstream>
 #include <random>
 #include <stdexcept>
@@ -84,6 +86,7 @@ void runTool(const std::vector<std::string>& args, const std::string& input) {
   if (rc != 0) throw std::runtime_error("cannot start " + tool);
   int status = 0;
   while (waitpid(pid, &status, 0) < 0) {
+    if (errno != EINTR) throw std::runtime_error("cannot wait for " + tool);
   }
   if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) {
     throw std::runtime_error(tool + " " + args.front() + " failed");

@@ -15,7 +15,7 @@ endif()
 
 set(_xgb_models ${CMAKE_BINARY_DIR}/xgboost-bench-models)
 add_custom_command(
-  OUTPUT ${_xgb_models}/m2000_d8.txt
+  OUTPUT ${_xgb_models}/m2000_d8.txt ${_xgb_models}/m2000_d8.ubj
   COMMAND ${RELIQA_BENCH_PYTHON} ${CMAKE_CURRENT_LIST_DIR}/xgboost_models.py $<TARGET_FILE:reliqa> ${_xgb_models}
   DEPENDS reliqa ${CMAKE_CURRENT_LIST_DIR}/xgboost_models.py
   COMMENT "Training and converting the XGBoost benchmark models (a few minutes)"

@@ -46,7 +46,8 @@ std::optional<std::string> whyNotStorable(int32_t id, double x) {
   std::string stored;
   try {
     stored = thornvale::featureMapToJson(FeatureMap{{id, x}});
-  } catch (const std::exception&) {
+  } catch (const std::exception& e) {
+    if (std::isfinite(x)) return std::string("cannot be stored: ") + e.what();
     return std::string("reads as ") + (std::isnan(x) ? "NaN" : "infinity") + ", which the store cannot hold";
   }
   try {
