@@ -162,6 +162,11 @@ bool runWithFault(FaultySqliteVfs& vfs, uint64_t k, bool sticky, const std::stri
     EXPECT_TRUE(allowed.count(value)) << where << ": " << key << " holds a value it was never given";
   }
   for (const auto& [key, value] : before) EXPECT_TRUE(after.count(key)) << where << ": " << key << " was lost";
+  if (journal) {
+    for (const auto& [key, w] : journal->writes()) {
+      EXPECT_TRUE(!w.lastDone || after.count(key)) << where << ": " << key << " was reported stored but is absent";
+    }
+  }
   return fired;
 }
 

@@ -19,6 +19,13 @@ FaultInjectingKeyValueStore::Failure FaultInjectingKeyValueStore::Plan::next() {
   return where;
 }
 
+std::pair<FaultInjectingKeyValueStore::Failure, std::exception_ptr> FaultInjectingKeyValueStore::nextCall(Plan FaultInjectingKeyValueStore::*kind) {
+  sync::MutexLock lock(mutex_);
+  Plan& plan = this->*kind;
+  const Failure failure = plan.next();
+  return {failure, plan.error};
+}
+
 FaultInjectingKeyValueStore::FaultInjectingKeyValueStore(std::shared_ptr<PersistentKeyValueStore> wrapped)
     : wrapped_(std::move(wrapped)) {
   if (!wrapped_) throw std::invalid_argument("FaultInjectingKeyValueStore needs a store to wrap");
@@ -26,13 +33,7 @@ FaultInjectingKeyValueStore::FaultInjectingKeyValueStore(std::shared_ptr<Persist
 
 Future<std::optional<PersistentKeyValueStore::Entry>> FaultInjectingKeyValueStore::fetch(
     const std::string& key, std::optional<std::string> option) {
-  Failure failure;
-  std::exception_ptr error;
-  {
-    sync::MutexLock lock(mutex_);
-    failure = fetches_.next();
-    error = fetches_.error;
-  }
+  auto [failure, error] = nextCall(&FaultInjectingKeyValueStore::fetches_);
   if (failure == Failure::kInCall) std::rethrow_exception(error);
   if (failure == Failure::kInGet) return makeFailedFuture<std::optional<Entry>>(error);
   return wrapped_->fetch(key, std::move(option));
@@ -40,13 +41,7 @@ Future<std::optional<PersistentKeyValueStore::Entry>> FaultInjectingKeyValueStor
 
 Future<void> FaultInjectingKeyValueStore::store(const std::string& key, const FileUtils::BinaryData& value,
                                                 FileUtils::BinaryData&& extra) {
-  Failure failure;
-  std::exception_ptr error;
-  {
-    sync::MutexLock lock(mutex_);
-    failure = stores_.next();
-    error = stores_.error;
-  }
+  auto [failure, error] = nextCall(&FaultInjectingKeyValueStore::stores_);
   if (failure == Failure::kInCall) std::rethrow_exception(error);
   if (failure == Failure::kInGet) return makeFailedFuture<void>(error);
   return wrapped_->store(key, value, std::move(extra));

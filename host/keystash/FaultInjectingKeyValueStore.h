@@ -19,6 +19,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 
 #include "host/keystash/PersistentKeyValueStore.h"
 #include "host/sync/Mutex.h"
@@ -53,6 +54,9 @@ class FaultInjectingKeyValueStore final : public PersistentKeyValueStore {
     // Counts one call; where it fails, if it does.
     Failure next();
   };
+
+  // Counts a call of one kind (fetches_ or stores_); where it fails, and with what.
+  std::pair<Failure, std::exception_ptr> nextCall(Plan FaultInjectingKeyValueStore::*kind) EXCLUDES(mutex_);
 
   const std::shared_ptr<PersistentKeyValueStore> wrapped_;
   mutable sync::Mutex mutex_;

@@ -167,9 +167,7 @@ simdjson::ondemand::array JsonDoc::getArray(simdjson::ondemand::value& v, const 
   return take(v.get_array(), path);
 }
 
-namespace {
-
-std::string_view trimmedToken(simdjson::ondemand::value& v) {
+std::string_view JsonDoc::tokenOf(simdjson::ondemand::value& v) {
   std::string_view token = v.raw_json_token();
   while (!token.empty() && (token.back() == ' ' || token.back() == '\n' || token.back() == '\r' ||
                             token.back() == '\t')) {
@@ -177,6 +175,8 @@ std::string_view trimmedToken(simdjson::ondemand::value& v) {
   }
   return token;
 }
+
+namespace {
 
 bool isDigit(char c) { return c >= '0' && c <= '9'; }
 
@@ -221,7 +221,7 @@ bool isJsonNumber(std::string_view t) {
 double JsonDoc::getDouble(simdjson::ondemand::value& v, const std::string& path) {
   json_type t = typeOf(*this, v, path);
   if (t != json_type::number) fail(v, where(path) + "expected a number, got " + typeWord(t));
-  const std::string_view token = trimmedToken(v);
+  const std::string_view token = tokenOf(v);
   if (hasLongDigitRun(token)) {
     // simdjson's On-Demand reader misreads such numbers (0.25000000000000000000
     // comes out as -0.0655...) and refuses long exponents that its DOM reader
@@ -245,11 +245,7 @@ double JsonDoc::getDouble(simdjson::ondemand::value& v, const std::string& path)
 int64_t JsonDoc::getInt(simdjson::ondemand::value& v, const std::string& path, int64_t min, int64_t max) {
   json_type t = typeOf(*this, v, path);
   if (t != json_type::number) fail(v, where(path) + "expected an integer, got " + typeWord(t));
-  std::string token(v.raw_json_token());
-  while (!token.empty() && (token.back() == ' ' || token.back() == '\n' || token.back() == '\r' ||
-                            token.back() == '\t')) {
-    token.pop_back();
-  }
+  const std::string token(tokenOf(v));
   number_type nt;
   if (v.get_number_type().get(nt) || nt == number_type::floating_point_number) {
     fail(v, where(path) + "expected an integer, got " + token);

@@ -53,6 +53,8 @@ class JsonDoc {
   bool getBool(simdjson::ondemand::value& v, const std::string& path);
   std::string getString(simdjson::ondemand::value& v, const std::string& path);
   bool isNull(simdjson::ondemand::value& v, const std::string& path);
+  // A value's text as written, without the white space that follows it.
+  static std::string_view tokenOf(simdjson::ondemand::value& v);
   // The JSON type of a value, for messages ("a string", "an object", ...).
   std::string typeName(simdjson::ondemand::value& v, const std::string& path);
 

@@ -51,11 +51,7 @@ void forEachElement(JsonDoc& doc, array arr, const std::string& path, F&& onElem
 // value (XGBoost writes subnormal floats).
 float readFloat(JsonDoc& doc, value& v, const std::string& path) {
   doc.getDouble(v, path);  // type and syntax check
-  std::string token(v.raw_json_token());
-  while (!token.empty() && (token.back() == ' ' || token.back() == '\n' || token.back() == '\r' ||
-                            token.back() == '\t')) {
-    token.pop_back();
-  }
+  const std::string token(JsonDoc::tokenOf(v));
   errno = 0;
   float f = std::strtof(token.c_str(), nullptr);
   if (errno == ERANGE && std::isinf(f)) doc.fail(v, path + ": " + token + " is outside the range of a float");
