@@ -17,14 +17,18 @@
 // splits and x > t at the others, the root included. unnormalizedScore()
 // walks many trees at once so that their memory loads overlap, yet adds the
 // leaves in tree order, so it is bit-identical to unnormalizedScoreOneByOne().
-// It walks kWalkGroup plain trees per call of a kernel (FastTreeEnsembleSimd.h:
-// AVX-512 where the CPU has it, else scalar) over a second copy of their
-// nodes made by init(): 8 bytes per node, 16 more per tree that is a single
-// leaf, and 16 bytes per tree. Without that copy, or when a test asks for
+// It walks the plain trees over a second copy of them, laid out by init() for
+// the kernel in use. Where the CPU has AVX-512, kWalkGroup trees per call of
+// the vector kernel (FastTreeEnsembleSimd.h), 8 bytes per node, 16 more per
+// tree that is a single leaf, and 16 bytes per tree; trees deeper than
+// kMaxGatherDepth or with more than kWalkMaxDistance nodes are not copied.
+// Elsewhere, kCompleteGroup trees per call of the scalar walk of complete
+// trees (CompleteTreeWalk.h), every tree padded to its group's depth:
+// 8 bytes per split and 4 per leaf of the padded trees; trees deeper than
+// kCompleteMaxDepth are not copied. Without a copy, or when a test asks for
 // WalkKernel::kPortable, it walks 8 compiled trees in lock step. Trees with
-// equality features, deeper than kMaxGatherDepth or with more than
-// kWalkMaxDistance nodes, and forests reading more than kMaxGatherFeatures
-// positions, are not copied and take the walks of the compiled trees.
+// equality features, trees not copied, and forests reading more than
+// kMaxGatherFeatures positions take the walks of the compiled trees.
 //
 // Errors: init() returns false for a null forest and (after an ERROR log) for
 // a decreasing modelIndexMap; it throws std::range_error when a split's
@@ -61,6 +65,7 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/CompleteTreeWalk.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsembleSimd.h"
 
 namespace thornvale {
@@ -133,9 +138,8 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     checkLength(features);
     const float* x = features.data();
     const auto [first, end] = selectModel(x);
-    if (kernel_ != WalkKernel::kPortable && !walk_.empty()) {
-      return sumGathered(x, first, end);
-    }
+    if (kernel_ == WalkKernel::kScalar && !complete_.empty()) return sumComplete(x, first, end);
+    if (kernel_ == WalkKernel::kAvx512 && !walk_.empty()) return sumGathered(x, first, end);
     return sumInterleaved(x, first, end);
   }
   double score(const std::vector<float>& features) const override {
@@ -157,17 +161,21 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   int featureIdBits() const override { return static_cast<int>(8 * sizeof(FeatureIdT)); }
 
   // The kernel that unnormalizedScore() uses: the best one of this CPU until
-  // useWalkKernel() picks another. Changing it while other threads score is
-  // a data race.
+  // useWalkKernel() picks another, which lays the trees out for it if they
+  // are not yet. Changing it while other threads score is a data race.
   WalkKernel walkKernel() const { return kernel_; }
   // Returns false, and changes nothing, when the CPU cannot run `kernel`.
   bool useWalkKernel(WalkKernel kernel) {
     if (!walkKernelSupported(kernel)) return false;
     kernel_ = kernel;
+    buildWalkCopy();
     return true;
   }
-  // Bytes held by the copy of the nodes that the gather kernels walk.
-  size_t gatherBytes() const { return walk_.bytes(); }
+  // Bytes held by the copy of the trees that the current kernel walks (0 for
+  // kPortable, or when the kernel takes none of the trees).
+  size_t gatherBytes() const {
+    return kernel_ == WalkKernel::kScalar ? complete_.bytes() : kernel_ == WalkKernel::kAvx512 ? walk_.bytes() : 0;
+  }
 
   // The range [first, end) of trees that the selector chooses for `features`.
   std::pair<size_t, size_t> selectModel(const std::vector<float>& features) const {
@@ -344,18 +352,51 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
 
   static bool gatherable(const FlatTree& tree);
-  void buildGatherNodes();
+  void buildWalkCopy();
+
+  // The features, the NaN slot at position requiredFeatures_, and NaN up to a
+  // multiple of 32 entries (the vector kernel loads whole registers).
+  using FeatureBuffer = float[(kMaxGatherFeatures + 32) / 32 * 32];
+  size_t copyFeatures(const float* features, FeatureBuffer& x) const {
+    const size_t used = requiredFeatures_;
+    if (used != 0) std::copy(features, features + used, x);
+    const size_t slots = used + 1;
+    std::fill(x + used, x + (slots + 31) / 32 * 32, std::numeric_limits<float>::quiet_NaN());
+    return slots;
+  }
+
+  // Groups of kCompleteGroup trees, walked a level at a time as complete
+  // trees; trees that the layout does not take are walked here.
+  double sumComplete(const float* features, size_t first, size_t end) const {
+    alignas(64) FeatureBuffer x;
+    copyFeatures(features, x);
+    double sum = baseScore_;
+    float leaves[kCompleteGroup];
+    for (size_t g = first / kCompleteGroup; g * kCompleteGroup < end; ++g) {
+      const size_t base = g * kCompleteGroup;
+      const size_t stop = std::min(end, base + kCompleteGroup);
+      const uint32_t taken = complete_.taken[g];
+      const CompleteSplit* splits = complete_.splits.data() + complete_.splitStart[g];
+      const float* values = complete_.leaves.data() + complete_.leafStart[g];
+      walkComplete(complete_.depths[g], splits, values, x, leaves);
+      if (taken == kCompleteAllTaken && first <= base && stop == base + kCompleteGroup) {
+        for (float v : leaves) sum += static_cast<double>(v);
+        continue;
+      }
+      for (size_t i = std::max(first, base); i < stop; ++i) {
+        const float v = (taken >> (i - base) & 1) ? leaves[i - base] : leafValue(trees_[i], features);
+        sum += static_cast<double>(v);
+      }
+    }
+    return sum;
+  }
 
   // Groups of kWalkGroup consecutive trees go to the kernel; lanes of trees
   // that it does not take walk the constant tree at index 0, and those trees
   // are walked here instead.
   double sumGathered(const float* features, size_t first, size_t end) const {
-    // The features, the NaN slot, and NaN up to a multiple of 32 entries.
-    alignas(64) float x[(kMaxGatherFeatures + 32) / 32 * 32];
-    const size_t used = requiredFeatures_;
-    if (used != 0) std::copy(features, features + used, x);
-    const size_t slots = used + 1;
-    std::fill(x + used, x + (slots + 31) / 32 * 32, std::numeric_limits<float>::quiet_NaN());
+    alignas(64) FeatureBuffer x;
+    const size_t slots = copyFeatures(features, x);
     double sum = baseScore_;
     float leaves[kWalkGroup];
     for (size_t i = first; i < end; i += kWalkGroup) {
@@ -381,9 +422,12 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   std::vector<uint32_t> featureMapping_;
   bool remap_ = false;
   size_t requiredFeatures_ = 0;
-  // The plain trees again, for the gather kernels (FastTreeEnsembleSimd.h);
-  // empty when the kernels cannot be used for this forest.
+  // The plain trees again, laid out for the kernel in use: walk nodes for the
+  // vector kernel (FastTreeEnsembleSimd.h), complete trees for the scalar one
+  // (CompleteTreeWalk.h). Empty until a kernel needs it, and when it cannot
+  // take any tree of this forest.
   WalkForest walk_;
+  CompleteForest complete_;
   WalkKernel kernel_ = bestWalkKernel();
 };
 
@@ -392,6 +436,7 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
   if (forest == nullptr) return false;
   trees_.clear();
   walk_ = WalkForest{};
+  complete_ = CompleteForest{};
   baseScore_ = forest->baseScore;
   featureMapping_ = forest->featureMapping;
   requiredFeatures_ = 0;
@@ -418,7 +463,7 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
     if (!selector.tree->root) throw std::runtime_error(label(kSelector) + " has no nodes");
     compileTree(*selector.tree->root, 1.0, selector_, kSelector, pending);
   }
-  buildGatherNodes();
+  buildWalkCopy();
 
   modelIndexMap_ = forest->modelIndexMap;
   for (size_t i = 1; i < modelIndexMap_.size(); ++i) {
@@ -437,9 +482,15 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::gatherable(const FlatTree& tre
 }
 
 template <typename FeatureIdT, typename NodeIndexT>
-void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildGatherNodes() {
+void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildWalkCopy() {
   if (requiredFeatures_ > kMaxGatherFeatures) return;
-  walk_ = buildWalkForest(trees_, kLeaf, static_cast<uint32_t>(requiredFeatures_), gatherable);
+  const auto nanSlot = static_cast<uint32_t>(requiredFeatures_);
+  if (kernel_ == WalkKernel::kAvx512 && walk_.empty()) {
+    walk_ = buildWalkForest(trees_, kLeaf, nanSlot, gatherable);
+  } else if (kernel_ == WalkKernel::kScalar && complete_.empty()) {
+    complete_ = buildCompleteForest(trees_, kLeaf, nanSlot,
+                                    [](const FlatTree& tree) { return !tree.hasEqualityFeature; });
+  }
 }
 
 template <typename FeatureIdT, typename NodeIndexT>

@@ -102,29 +102,6 @@ __attribute__((target("avx512f"))) void walkAvx512(const WalkNode* nodes, const 
 }  // namespace
 #endif
 
-namespace {
-// Lane after lane, one level per round; with this many independent lanes the
-// loads of one round overlap as well.
-void walkScalar(const WalkNode* nodes, const uint32_t* roots, const WalkNode* rootNodes,
-                uint32_t rounds, const float* x, float* leaves) {
-  uint32_t at[kWalkGroup];
-  for (size_t k = 0; k < kWalkGroup; ++k) {
-    const WalkNode n = rootNodes[k];
-    at[k] = roots[k] + (n.link >> kWalkFeatureBits) +
-            static_cast<uint32_t>(!(x[n.link & kWalkMaxFeature] <= n.value));
-  }
-  for (uint32_t r = 1; r < rounds; ++r) {
-#pragma GCC unroll 16
-    for (size_t k = 0; k < kWalkGroup; ++k) {
-      const WalkNode n = nodes[at[k]];
-      at[k] += (n.link >> kWalkFeatureBits) +
-               static_cast<uint32_t>(x[n.link & kWalkMaxFeature] > n.value);
-    }
-  }
-  for (size_t k = 0; k < kWalkGroup; ++k) leaves[k] = nodes[at[k]].value;
-}
-}  // namespace
-
 bool walkKernelSupported(WalkKernel kernel) {
   switch (kernel) {
     case WalkKernel::kPortable:
@@ -147,8 +124,6 @@ void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots,
                const WalkNode* rootNodes, uint32_t rounds, const float* features, size_t slots,
                float* leaves) {
   switch (kernel) {
-    case WalkKernel::kScalar:
-      return walkScalar(nodes, roots, rootNodes, rounds, features, leaves);
 #ifdef RELIQA_WALK_X86
     case WalkKernel::kAvx512:
       // Few features are picked from registers rather than gathered.

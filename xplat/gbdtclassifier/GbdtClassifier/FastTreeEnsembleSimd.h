@@ -1,6 +1,6 @@
-// Kernels that walk a group of compiled trees at once, in lock step, the
-// format of the nodes they walk, and buildWalkForest(), which lays compiled
-// trees out in that format.
+// The vector kernel that walks a group of compiled trees at once, in lock
+// step, the format of the nodes it walks, and buildWalkForest(), which lays
+// compiled trees out in that format; and the choice among all walk kernels.
 //
 // The trees to walk live in one array of 8-byte WalkNode, so that a single
 // gather base serves every lane and one 64-bit load brings a whole node; a
@@ -20,10 +20,11 @@
 // included), and that every node index fits in a signed 32-bit integer: the
 // gathers read nothing else.
 //
-// A scalar kernel runs on any CPU; on x86-64 CPUs with AVX-512F a vector
-// kernel walks 16 lanes per instruction, gathering the nodes and, for up to
-// 128 feature slots, picking the features from registers. The kernel is
-// chosen at run time; nothing needs AVX-512 at build time.
+// On x86-64 CPUs with AVX-512F the kernel walks 16 lanes per instruction,
+// gathering the nodes and, for up to 128 feature slots, picking the features
+// from registers. Other CPUs run the scalar walk of complete trees
+// (CompleteTreeWalk.h). The kernel is chosen at run time; nothing needs
+// AVX-512 at build time.
 // Thread-safe: the functions have no state.
 #pragma once
 
@@ -53,7 +54,7 @@ constexpr WalkNode walkNode(uint32_t feature, uint32_t distance, float value) {
 
 enum class WalkKernel {
   kPortable,  // no walk nodes: 8 compiled trees in lock step (any CPU)
-  kScalar,    // walkGroup() in scalar code (any CPU)
+  kScalar,    // walkComplete() over complete trees (any CPU)
   kAvx512,    // walkGroup() with 16 lanes per vector
 };
 
@@ -138,7 +139,7 @@ WalkKernel bestWalkKernel();
 // of those nodes) for `rounds` >= 1 steps and stores their leaf values in
 // `leaves`. `features` holds `slots` values
 // and is readable up to the next multiple of 32 (kernels may load whole
-// registers of it). `kernel` must be supported and not kPortable.
+// registers of it). `kernel` must be kAvx512, and supported.
 void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots,
                const WalkNode* rootNodes, uint32_t rounds, const float* features, size_t slots,
                float* leaves);

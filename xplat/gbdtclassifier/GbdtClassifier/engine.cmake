@@ -5,7 +5,8 @@ add_library(gbdt STATIC
   BoostingModel/serialize.cc
   BoostingModel/ModelWriter.cc
   BoostingModel/BoostingModel.cc
-  FastTreeEnsembleSimd.cc)
+  FastTreeEnsembleSimd.cc
+  CompleteTreeWalk.cc)
 target_include_directories(gbdt PUBLIC ${PROJECT_SOURCE_DIR})
 target_link_libraries(gbdt PUBLIC glog::glog)
 

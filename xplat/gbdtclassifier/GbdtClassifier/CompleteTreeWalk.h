@@ -1,0 +1,148 @@
+// The walk that CPUs without a vector kernel run (phones among them): trees
+// laid out as complete binary trees, walked a level at a time over groups of
+// kCompleteGroup trees, and buildCompleteForest(), which lays compiled trees
+// out that way.
+//
+// A tree of depth D becomes 2^D - 1 splits in breadth-first order, so that
+// the children of split i are 2i + 1 and 2i + 2 and need not be stored, and
+// 2^D leaf values; every tree of a group is padded to the group's depth. A
+// leaf above that depth becomes splits on a feature slot that always holds
+// NaN whose leaves all carry its value, so either way leads to it. A step is
+// one node load, one feature load, one compare and an add, with no branch.
+//
+// walkComplete() walks the kCompleteGroup trees of one group for D steps:
+// the first step goes to the second child unless x <= t, the later ones when
+// x > t (the plain walk's NaN rule), and writes each tree's leaf value.
+// Thread-safe: the functions have no state.
+#pragma once
+
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
+#include <vector>
+
+namespace thornvale {
+
+struct CompleteSplit {
+  uint32_t feature;  // position in the feature buffer (the NaN slot for padding)
+  float threshold;
+};
+static_assert(sizeof(CompleteSplit) == 8, "complete-tree splits are two words");
+
+// Trees per group: the bits of a taken mask.
+constexpr size_t kCompleteGroup = 32;
+constexpr uint32_t kCompleteAllTaken = 0xFFFFFFFFu;
+// Deepest tree the layout takes: a group of that depth holds 32 * 12 KiB.
+constexpr uint32_t kCompleteMaxDepth = 10;
+
+// Group g holds trees [g * kCompleteGroup, (g + 1) * kCompleteGroup), each
+// of depth depths[g] (>= 1): its splits start at splits[splitStart[g]] and
+// its leaves at leaves[leafStart[g]], tree after tree. Bit k of taken[g] says
+// whether tree g * kCompleteGroup + k is in the layout; a lane of a tree that
+// is not (or past the last tree) walks a tree whose leaves are 0.
+struct CompleteForest {
+  std::vector<CompleteSplit> splits;
+  std::vector<float> leaves;
+  std::vector<uint32_t> depths;
+  std::vector<size_t> splitStart;
+  std::vector<size_t> leafStart;
+  std::vector<uint32_t> taken;
+
+  bool empty() const { return depths.empty(); }
+  size_t bytes() const {
+    return splits.size() * sizeof(CompleteSplit) + leaves.size() * sizeof(float) +
+           (depths.size() + taken.size()) * sizeof(uint32_t) +
+           (splitStart.size() + leafStart.size()) * sizeof(size_t);
+  }
+};
+
+// Lays out compiled trees. A Tree has `nodes` (root first, the two children
+// of a split adjacent, each node with `featureId`, `child` (index of its
+// first child) and `value`, a leaf marked by featureId == leafId) and `depth`;
+// `takes(tree)` says whether the walk may take it, and trees deeper than
+// kCompleteMaxDepth are never taken. `nanSlot` is the feature position that
+// always holds NaN. Padding is bounded: when a group's padded splits would
+// exceed four times the nodes of its trees (or 63 per tree, whichever is
+// more), its deepest trees are left out until they do not. Returns an empty
+// forest when no tree is taken.
+template <typename Tree, typename Takes>
+CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafId, uint32_t nanSlot,
+                                   Takes takes) {
+  CompleteForest out;
+  bool any = false;
+  for (size_t first = 0; first < trees.size(); first += kCompleteGroup) {
+    const size_t end = std::min(trees.size(), first + kCompleteGroup);
+    bool taken[kCompleteGroup] = {};
+    uint64_t nodes = 0;
+    for (size_t i = first; i < end; ++i) {
+      if (trees[i].depth <= kCompleteMaxDepth && takes(trees[i])) {
+        taken[i - first] = true;
+        nodes += trees[i].nodes.size();
+      }
+    }
+    const uint64_t budget = std::max<uint64_t>(4 * nodes, 63 * kCompleteGroup);
+    uint32_t depth;
+    for (;;) {
+      depth = 1;
+      for (size_t i = first; i < end; ++i) {
+        if (taken[i - first]) depth = std::max(depth, trees[i].depth);
+      }
+      if (((uint64_t{1} << depth) - 1) * kCompleteGroup <= budget) break;
+      for (size_t i = first; i < end; ++i) {
+        if (taken[i - first] && trees[i].depth == depth) taken[i - first] = false;
+      }
+    }
+    const size_t splitCount = (size_t{1} << depth) - 1;
+    const size_t leafCount = size_t{1} << depth;
+    uint32_t mask = 0;
+    for (size_t k = 0; k < kCompleteGroup; ++k) mask |= static_cast<uint32_t>(taken[k]) << k;
+    out.taken.push_back(mask);
+    out.depths.push_back(depth);
+    out.splitStart.push_back(out.splits.size());
+    out.leafStart.push_back(out.leaves.size());
+    out.splits.resize(out.splits.size() + kCompleteGroup * splitCount, CompleteSplit{nanSlot, 0.0f});
+    out.leaves.resize(out.leaves.size() + kCompleteGroup * leafCount, 0.0f);
+    for (size_t i = first; i < end; ++i) {
+      if (!taken[i - first]) continue;
+      any = true;
+      CompleteSplit* splits = out.splits.data() + out.splitStart.back() + (i - first) * splitCount;
+      float* leaves = out.leaves.data() + out.leafStart.back() + (i - first) * leafCount;
+      // Pairs of (compiled node, complete position), depth first.
+      struct Place {
+        size_t node;
+        size_t at;
+      };
+      Place stack[2 * kCompleteMaxDepth + 2];
+      size_t top = 0;
+      stack[top++] = Place{0, 0};
+      while (top != 0) {
+        const Place p = stack[--top];
+        const auto& n = trees[i].nodes[p.node];
+        if (n.featureId == leafId) {
+          // The leaves under position p.at are a run of the last level.
+          size_t lo = p.at, hi = p.at;
+          while (lo < splitCount) {
+            lo = 2 * lo + 1;
+            hi = 2 * hi + 2;
+          }
+          std::fill(leaves + (lo - splitCount), leaves + (hi - splitCount) + 1, n.value);
+          continue;
+        }
+        splits[p.at] = CompleteSplit{static_cast<uint32_t>(n.featureId), n.value};
+        stack[top++] = Place{static_cast<size_t>(n.child) + 1, 2 * p.at + 2};
+        stack[top++] = Place{static_cast<size_t>(n.child), 2 * p.at + 1};
+      }
+    }
+  }
+  if (!any) return CompleteForest{};
+  return out;
+}
+
+// Walks the kCompleteGroup trees of depth `depth` (1 to kCompleteMaxDepth)
+// whose splits and leaves start at `splits` and `leaves`, and stores their
+// leaf values in `out`. `features` has a slot for every feature position the
+// splits name.
+void walkComplete(uint32_t depth, const CompleteSplit* splits, const float* leaves, const float* features,
+                  float* out);
+
+}  // namespace thornvale
