@@ -7,27 +7,64 @@
 // the children of split i are 2i + 1 and 2i + 2 and need not be stored, and
 // 2^D leaf values; every tree of a group is padded to the group's depth. A
 // leaf above that depth becomes splits on a feature slot that always holds
-// NaN whose leaves all carry its value, so either way leads to it. A step is
-// one node load, one feature load, one compare and an add, with no branch.
+// NaN whose leaves all carry its value, so either way leads to it.
 //
-// walkComplete() walks the kCompleteGroup trees of one group for D steps:
-// the first step goes to the second child unless x <= t, the later ones when
-// x > t (the plain walk's NaN rule), and writes each tree's leaf value.
+// Features and thresholds are compared as unsigned keys (completeKey()) that
+// order as the floats do, so that a step is one node load, one feature load,
+// an integer compare and an add with carry. The plain walk's NaN rule (at the
+// root, the second child unless x <= t; below it, the second child when
+// x > t) is built into the keys: a root split reads its feature from a second
+// set of keys in which NaN is above every threshold, and its NaN threshold is
+// below every feature; below the root, NaN features are below every
+// threshold, and a NaN threshold is above every feature. Both +0 and -0 get
+// the key of +0.
+//
+// walkComplete() walks groups of trees and writes each tree's leaf value.
 // Thread-safe: the functions have no state.
 #pragma once
 
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <vector>
 
 namespace thornvale {
 
 struct CompleteSplit {
-  uint32_t feature;  // position in the feature buffer (the NaN slot for padding)
-  float threshold;
+  // Position in the keys (the NaN slot for padding); at the root, the number
+  // of slots plus the position.
+  uint32_t feature;
+  uint32_t threshold;  // completeKey() of the threshold
 };
 static_assert(sizeof(CompleteSplit) == 8, "complete-tree splits are two words");
+
+// Key of a number that is not NaN: unsigned keys order as the numbers, and
+// -0 and +0 get the same key.
+inline uint32_t completeKey(float v) {
+  if (v == 0.0f) v = 0.0f;
+  uint32_t bits;
+  std::memcpy(&bits, &v, sizeof bits);
+  return (bits & 0x80000000u) ? ~bits : bits | 0x80000000u;
+}
+// Keys of a feature value below the root and at the root, and of a threshold
+// below the root and at the root; see above for NaN.
+inline uint32_t completeFeatureKey(float v) { return v != v ? 0 : completeKey(v); }
+inline uint32_t completeRootFeatureKey(float v) { return v != v ? UINT32_MAX : completeKey(v); }
+inline uint32_t completeThresholdKey(float t) { return t != t ? UINT32_MAX : completeKey(t); }
+inline uint32_t completeRootThresholdKey(float t) { return t != t ? 0 : completeKey(t); }
+
+// Fills keys[0, slots) with the keys of features[0, slots - 1) and of NaN
+// (the NaN slot, at slots - 1), and keys[slots, 2 * slots) with their root
+// keys.
+inline void completeKeys(const float* features, size_t slots, uint32_t* keys) {
+  for (size_t i = 0; i + 1 < slots; ++i) {
+    keys[i] = completeFeatureKey(features[i]);
+    keys[slots + i] = completeRootFeatureKey(features[i]);
+  }
+  keys[slots - 1] = 0;
+  keys[2 * slots - 1] = UINT32_MAX;
+}
 
 // Trees per group: the bits of a taken mask.
 constexpr size_t kCompleteGroup = 32;
@@ -61,7 +98,7 @@ struct CompleteForest {
 // first child) and `value`, a leaf marked by featureId == leafId) and `depth`;
 // `takes(tree)` says whether the walk may take it, and trees deeper than
 // kCompleteMaxDepth are never taken. `nanSlot` is the feature position that
-// always holds NaN. Padding is bounded: when a group's padded splits would
+// always holds NaN, the last of the nanSlot + 1 slots. Padding is bounded: when a group's padded splits would
 // exceed four times the nodes of its trees (or 63 per tree, whichever is
 // more), its deepest trees are left out until they do not. Returns an empty
 // forest when no tree is taken.
@@ -100,7 +137,7 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
     out.depths.push_back(depth);
     out.splitStart.push_back(out.splits.size());
     out.leafStart.push_back(out.leaves.size());
-    out.splits.resize(out.splits.size() + kCompleteGroup * splitCount, CompleteSplit{nanSlot, 0.0f});
+    out.splits.resize(out.splits.size() + kCompleteGroup * splitCount, CompleteSplit{nanSlot, 0});
     out.leaves.resize(out.leaves.size() + kCompleteGroup * leafCount, 0.0f);
     for (size_t i = first; i < end; ++i) {
       if (!taken[i - first]) continue;
@@ -128,7 +165,9 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
           std::fill(leaves + (lo - splitCount), leaves + (hi - splitCount) + 1, n.value);
           continue;
         }
-        splits[p.at] = CompleteSplit{static_cast<uint32_t>(n.featureId), n.value};
+        const auto feature = static_cast<uint32_t>(n.featureId);
+        splits[p.at] = p.at == 0 ? CompleteSplit{nanSlot + 1 + feature, completeRootThresholdKey(n.value)}
+                                 : CompleteSplit{feature, completeThresholdKey(n.value)};
         stack[top++] = Place{static_cast<size_t>(n.child) + 1, 2 * p.at + 2};
         stack[top++] = Place{static_cast<size_t>(n.child), 2 * p.at + 1};
       }
@@ -138,11 +177,14 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
   return out;
 }
 
-// Walks the kCompleteGroup trees of depth `depth` (1 to kCompleteMaxDepth)
-// whose splits and leaves start at `splits` and `leaves`, and stores their
-// leaf values in `out`. `features` has a slot for every feature position the
-// splits name.
-void walkComplete(uint32_t depth, const CompleteSplit* splits, const float* leaves, const float* features,
+// Walks the trees of groups [firstGroup, endGroup) of `forest` and stores
+// their leaf values in `out`, kCompleteGroup per group. `keys` is what
+// completeKeys() filled for the slots that the forest was laid out for.
+void walkComplete(const CompleteForest& forest, size_t firstGroup, size_t endGroup, const uint32_t* keys,
                   float* out);
+// The same walk, returning `sum` plus the leaf values widened to double, in
+// tree order.
+double sumComplete(const CompleteForest& forest, size_t firstGroup, size_t endGroup, const uint32_t* keys,
+                   double sum);
 
 }  // namespace thornvale

@@ -366,27 +366,35 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
 
   // Groups of kCompleteGroup trees, walked a level at a time as complete
-  // trees; trees that the layout does not take are walked here.
+  // trees. Runs of groups that lie inside [first, end) and whose trees are
+  // all in the layout are summed by the walk; in other groups, trees that
+  // the layout does not take are walked here.
   double sumComplete(const float* features, size_t first, size_t end) const {
-    alignas(64) FeatureBuffer x;
-    copyFeatures(features, x);
+    alignas(64) uint32_t keys[2 * (kMaxGatherFeatures + 1)];
+    completeKeys(features, requiredFeatures_ + 1, keys);
     double sum = baseScore_;
-    float leaves[kCompleteGroup];
-    for (size_t g = first / kCompleteGroup; g * kCompleteGroup < end; ++g) {
-      const size_t base = g * kCompleteGroup;
-      const size_t stop = std::min(end, base + kCompleteGroup);
-      const uint32_t taken = complete_.taken[g];
-      const CompleteSplit* splits = complete_.splits.data() + complete_.splitStart[g];
-      const float* values = complete_.leaves.data() + complete_.leafStart[g];
-      walkComplete(complete_.depths[g], splits, values, x, leaves);
-      if (taken == kCompleteAllTaken && first <= base && stop == base + kCompleteGroup) {
-        for (float v : leaves) sum += static_cast<double>(v);
+    const size_t endGroup = (end + kCompleteGroup - 1) / kCompleteGroup;
+    auto whole = [&](size_t g) {
+      return complete_.taken[g] == kCompleteAllTaken && g * kCompleteGroup >= first &&
+             (g + 1) * kCompleteGroup <= end;
+    };
+    for (size_t g = first / kCompleteGroup; g < endGroup;) {
+      size_t run = g;
+      while (run < endGroup && whole(run)) ++run;
+      if (run != g) {
+        sum = thornvale::sumComplete(complete_, g, run, keys, sum);
+        g = run;
         continue;
       }
+      float leaves[kCompleteGroup];
+      walkComplete(complete_, g, g + 1, keys, leaves);
+      const size_t base = g * kCompleteGroup;
+      const size_t stop = std::min(end, base + kCompleteGroup);
       for (size_t i = std::max(first, base); i < stop; ++i) {
-        const float v = (taken >> (i - base) & 1) ? leaves[i - base] : leafValue(trees_[i], features);
-        sum += static_cast<double>(v);
+        const bool taken = complete_.taken[g] >> (i - base) & 1;
+        sum += static_cast<double>(taken ? leaves[i - base] : leafValue(trees_[i], features));
       }
+      ++g;
     }
     return sum;
   }
