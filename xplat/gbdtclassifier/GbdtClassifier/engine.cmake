@@ -1,6 +1,7 @@
 # The boosted-tree engine: tree nodes, model reader and writer, compiled
 # forests and the boosting model.
 add_library(gbdt STATIC
+  BoostingModel/NodeArena.cc
   BoostingModel/tree.cc
   BoostingModel/serialize.cc
   BoostingModel/ModelWriter.cc
@@ -11,6 +12,7 @@ target_include_directories(gbdt PUBLIC ${PROJECT_SOURCE_DIR})
 target_link_libraries(gbdt PUBLIC glog::glog)
 
 foreach(test IN ITEMS
+    BoostingModel/NodeArena_test
     BoostingModel/tree_test
     BoostingModel/serialize_test
     BoostingModel/ModelWriter_test

@@ -132,7 +132,7 @@ struct NodeProblem {
 // null (after the error message) when a tag is unknown or missing; the
 // partly built subtree is discarded, so no absent node ever escapes.
 template <typename Source>
-std::unique_ptr<Node> readNodes(Source& src, NodeProblem* problem) {
+std::unique_ptr<Node> readNodes(Source& src, NodeProblem* problem, NodeArena& arena) {
   std::unique_ptr<Node> root;
   std::vector<std::unique_ptr<Node>*> pending{&root};
   while (!pending.empty()) {
@@ -143,13 +143,13 @@ std::unique_ptr<Node> readNodes(Source& src, NodeProblem* problem) {
       uint8_t tag = 0;
       const bool present = src.tag(tag);
       if (present && tag == kLeafTag) {
-        *slot = std::make_unique<ConstantNode>(src.template read<double>());
+        *slot = std::unique_ptr<Node>(new (arena) ConstantNode(src.template read<double>()));
         break;
       }
       if (present && tag == kSplitTag) {
         const auto index = src.template read<int32_t>();
         const auto pivot = src.template read<double>();
-        auto split = std::make_unique<LinearNode>(index, pivot);
+        std::unique_ptr<LinearNode> split(new (arena) LinearNode(index, pivot));
         LinearNode* raw = split.get();
         *slot = std::move(split);
         pending.push_back(&raw->right);
@@ -172,13 +172,13 @@ std::string hexByte(uint8_t b) {
 // Fills `out` from one undecoded tree line; `label()` names the tree in errors.
 template <typename Label>
 void readTree(std::string_view line, WeightedTree& out, int32_t version, const Label& label,
-              std::string& scratch) {
+              std::string& scratch, NodeArena& arena) {
   decodeInto(line, scratch);
   RecordBytes src(scratch);
   out.weight = src.read<double>();
   out.tree.reset();
   NodeProblem problem;
-  std::unique_ptr<Node> root = readNodes(src, &problem);
+  std::unique_ptr<Node> root = readNodes(src, &problem, arena);
   if (!root) {
     throw std::runtime_error(
         label() + " is malformed: " +
@@ -330,6 +330,7 @@ void Reader::readTrees(Forest& forest, int32_t version) {
   lines_.require(count, count, "trees");
   forest.trees.reserve(count);
   std::string scratch;
+  NodeArena arena;
   for (uint32_t i = 0; i < count; ++i) {
     WeightedTree entry;
     readTree(
@@ -338,7 +339,7 @@ void Reader::readTrees(Forest& forest, int32_t version) {
           return "tree " + std::to_string(i) + " (of " + std::to_string(count) +
                  ", counting from 0)";
         },
-        scratch);
+        scratch, arena);
     forest.trees.push_back(std::move(entry));
   }
 }
@@ -389,8 +390,9 @@ void Reader::readTrailer(Forest& forest, int32_t version) {
   if (readValue<int32_t>() != kModelMagic) return;
   WeightedTree selector;
   std::string scratch;
+  NodeArena arena;
   readTree(lines_.next(), selector, version, [] { return std::string("model selector tree"); },
-           scratch);
+           scratch, arena);
   forest.modelSelector = std::move(selector);
 
   const auto count = readValue<uint32_t>();
@@ -442,12 +444,14 @@ int32_t is_header(std::istream& in) { return parseHeader(read_base64_line(in)); 
 
 std::unique_ptr<Node> deserialize_node(std::istream& in) {
   StreamBytes src(in);
-  return readNodes(src, nullptr);
+  NodeArena arena;
+  return readNodes(src, nullptr, arena);
 }
 
 void deserialize_tree(const std::string& line, WeightedTree& out, int32_t version) {
   std::string scratch;
-  readTree(line, out, version, [] { return std::string("tree"); }, scratch);
+  NodeArena arena;
+  readTree(line, out, version, [] { return std::string("tree"); }, scratch, arena);
 }
 
 std::unique_ptr<Forest> deserialize(std::string_view text) { return Reader(text).read(); }

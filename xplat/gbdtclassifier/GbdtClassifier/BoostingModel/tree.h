@@ -20,6 +20,9 @@
 // and by clone(); linkTree() sets them and fills the tree's featureNames. The
 // printers name a feature by featureNames[index], or by its index where there
 // is no (non-empty) name or no tree link.
+//
+// Nodes come from the heap (plain new) or from a NodeArena (new (arena));
+// either way `delete` (and so unique_ptr) frees them.
 #pragma once
 
 #include <cstdint>
@@ -28,6 +31,8 @@
 #include <ostream>
 #include <string>
 #include <vector>
+
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/NodeArena.h"
 
 namespace thornvale {
 
@@ -39,6 +44,12 @@ class Node {
   Node(const Node&) = delete;
   Node& operator=(const Node&) = delete;
   virtual ~Node();
+
+  static void* operator new(size_t bytes) { return allocateNodeOnHeap(bytes); }
+  static void* operator new(size_t bytes, NodeArena& arena) { return arena.allocate(bytes); }
+  static void operator delete(void* node) noexcept { releaseNode(node); }
+  // Called only when a constructor throws after new (arena).
+  static void operator delete(void* node, NodeArena&) noexcept { releaseNode(node); }
 
   // Deep copy of the subtree; links of the copy are unset.
   virtual std::unique_ptr<Node> clone() const = 0;

@@ -1,0 +1,81 @@
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/NodeArena.h"
+
+#include <new>
+
+namespace thornvale {
+
+namespace {
+constexpr size_t kSlabBytes = 64 * 1024;
+constexpr size_t kAlign = NodeArena::kNodeAlign;
+constexpr size_t kPrefix = kAlign;  // the slab word, padded to keep blocks aligned
+constexpr size_t kHeader = 64;      // the slab's count, then blocks
+
+constexpr size_t roundUp(size_t n) { return (n + kAlign - 1) / kAlign * kAlign; }
+}  // namespace
+
+// A slab's count starts at kUnretired, so that frees cannot bring it to zero
+// while its arena may still hand out blocks; retiring subtracts kUnretired
+// minus the blocks handed out.
+struct NodeArena::Slab {
+  static constexpr uint32_t kUnretired = 1u << 31;
+  std::atomic<uint32_t> live{kUnretired};
+};
+static_assert(sizeof(NodeArena::Slab) <= kHeader && kHeader % kAlign == 0, "the slab header fits");
+
+namespace {
+void dropSlab(NodeArena::Slab* slab) {
+  slab->~Slab();
+  ::operator delete(static_cast<void*>(slab));
+}
+}  // namespace
+
+void* NodeArena::allocate(size_t bytes) {
+  if (bytes > kMaxNodeBytes) throw std::bad_alloc();
+  const size_t need = kPrefix + roundUp(bytes);
+  if (slab_ == nullptr || static_cast<size_t>(end_ - next_) < need) {
+    retire();
+    void* raw = ::operator new(kSlabBytes);
+    slab_ = new (raw) Slab;
+    next_ = static_cast<char*>(raw) + kHeader;
+    end_ = static_cast<char*>(raw) + kSlabBytes;
+    handedOut_ = 0;
+  }
+  char* block = next_;
+  next_ += need;
+  ++handedOut_;
+  *reinterpret_cast<Slab**>(block) = slab_;
+  return block + kPrefix;
+}
+
+void NodeArena::retire() noexcept {
+  if (slab_ == nullptr) return;
+  const uint32_t drop = Slab::kUnretired - handedOut_;
+  if (slab_->live.fetch_sub(drop, std::memory_order_acq_rel) == drop) {
+    dropSlab(slab_);
+  }
+  slab_ = nullptr;
+  next_ = end_ = nullptr;
+}
+
+NodeArena::~NodeArena() { retire(); }
+
+void* allocateNodeOnHeap(size_t bytes) {
+  char* block = static_cast<char*>(::operator new(kPrefix + bytes));
+  *reinterpret_cast<void**>(block) = nullptr;
+  return block + kPrefix;
+}
+
+void releaseNode(void* node) noexcept {
+  if (node == nullptr) return;
+  char* block = static_cast<char*>(node) - kPrefix;
+  auto* slab = *reinterpret_cast<NodeArena::Slab**>(block);
+  if (slab == nullptr) {
+    ::operator delete(block);
+    return;
+  }
+  if (slab->live.fetch_sub(1, std::memory_order_acq_rel) == 1) {
+    dropSlab(slab);
+  }
+}
+
+}  // namespace thornvale
