@@ -105,6 +105,11 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
                 "NodeIndexT must be an unsigned integer");
 
  public:
+  // Scores with `kernel` (see walkKernel()); a kernel that this CPU cannot
+  // run gives the best one it can.
+  explicit FastTreeEnsembleOOP(WalkKernel kernel = bestWalkKernel())
+      : kernel_(walkKernelSupported(kernel) ? kernel : bestWalkKernel()) {}
+
   struct FlatNode {
     FeatureIdT featureId;  // split: feature position; kLeaf for a leaf
     NodeIndexT child;      // split: index of the first child; leaf: 0
@@ -221,8 +226,13 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
 
   void buildEqualityMask(const Forest& forest, bool remap);
   int32_t checkedPosition(int32_t featureId, size_t tree) const;
-  void compileTree(const Node& root, double scale, FlatTree& out, size_t tree,
-                   std::vector<Pending>& pending);
+  // What compileTree() reuses from tree to tree: its work list, and the nodes
+  // of the tree being compiled, copied out at their final size.
+  struct CompileScratch {
+    std::vector<Pending> pending;
+    std::vector<FlatNode> nodes;
+  };
+  void compileTree(const Node& root, double scale, FlatTree& out, size_t tree, CompileScratch& scratch);
 
   // Selector walk result as a model number: truncation toward zero, NaN and
   // negative values give 0, values beyond the range the largest value.
@@ -436,7 +446,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   // take any tree of this forest.
   WalkForest walk_;
   CompleteForest complete_;
-  WalkKernel kernel_ = bestWalkKernel();
+  WalkKernel kernel_;
 };
 
 template <typename FeatureIdT, typename NodeIndexT>
@@ -454,14 +464,14 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
   remap_ = remap && !featureMapping_.empty();
   buildEqualityMask(*forest, remap);
 
-  std::vector<Pending> pending;
+  CompileScratch scratch;
   trees_.reserve(forest->trees.size());
   for (size_t i = 0; i < forest->trees.size(); ++i) {
     const WeightedTree& entry = forest->trees[i];
     if (entry.weight == 0.0) continue;
     if (!entry.tree || !entry.tree->root) throw std::runtime_error(label(i) + " has no nodes");
     FlatTree flat;
-    compileTree(*entry.tree->root, entry.weight, flat, i, pending);
+    compileTree(*entry.tree->root, entry.weight, flat, i, scratch);
     trees_.push_back(std::move(flat));
   }
 
@@ -469,7 +479,7 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
   const WeightedTree& selector = forest->modelSelector;
   if (selector.weight != 0.0 && selector.tree) {
     if (!selector.tree->root) throw std::runtime_error(label(kSelector) + " has no nodes");
-    compileTree(*selector.tree->root, 1.0, selector_, kSelector, pending);
+    compileTree(*selector.tree->root, 1.0, selector_, kSelector, scratch);
   }
   buildWalkCopy();
 
@@ -560,12 +570,14 @@ int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::checkedPosition(int32_t fea
 template <typename FeatureIdT, typename NodeIndexT>
 void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, double scale,
                                                               FlatTree& out, size_t tree,
-                                                              std::vector<Pending>& pending) {
-  out.nodes.clear();
+                                                              CompileScratch& scratch) {
+  std::vector<Pending>& pending = scratch.pending;
+  std::vector<FlatNode>& nodes = scratch.nodes;
+  nodes.clear();
   out.hasEqualityFeature = false;
   out.depth = 0;
   out.leafDepth = std::numeric_limits<uint32_t>::max();
-  out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+  nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
   // Depth first: go down each left spine at once, keeping right children for
   // later, so that left subtrees are laid out before right ones.
   pending.assign(1, Pending{&root, 0, 0});
@@ -580,8 +592,8 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, 
       out.depth = std::max(out.depth, p.depth);
       if (node->isLeaf()) {
         out.leafDepth = std::min(out.leafDepth, p.depth);
-        out.nodes[p.slot].featureId = kLeaf;
-        out.nodes[p.slot].value =
+        nodes[p.slot].featureId = kLeaf;
+        nodes[p.slot].value =
             static_cast<float>(static_cast<const ConstantNode*>(node)->value * scale);
         break;
       }
@@ -599,23 +611,24 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, 
         throw std::range_error("feature id > max size. Use large type for FeatureIdT");
       }
       const int32_t position = checkedPosition(id, tree);
-      const size_t first = out.nodes.size();
+      const size_t first = nodes.size();
       if (first >= kNodeIndexLimit) {
         throw std::range_error("node index > max size. Use large type for NodeIndexT");
       }
-      FlatNode& n = out.nodes[p.slot];
+      FlatNode& n = nodes[p.slot];
       n.featureId = static_cast<FeatureIdT>(position);
       n.value = static_cast<float>(split.pivotValue);
       n.child = static_cast<NodeIndexT>(first);
       if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
       requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
-      out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
-      out.nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+      nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+      nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
       const uint32_t below = p.depth == UINT32_MAX ? p.depth : p.depth + 1;
       pending.push_back({split.right.get(), first + 1, below});
       p = Pending{split.left.get(), first, below};
     }
   }
+  out.nodes.assign(nodes.begin(), nodes.end());
 }
 
 }  // namespace thornvale

@@ -29,14 +29,14 @@ std::string joined(const List& items) {
 
 }  // namespace
 
-BoostingModel::BoostingModel(const std::string& serializedModel) {
+BoostingModel::BoostingModel(const std::string& serializedModel, WalkKernel kernel) {
   forest_ = deserialize(std::string_view(serializedModel));
 
   const std::vector<uint32_t> featureMapping = forest_->featureMapping;
   if (infoLogging()) LOG(INFO) << "featureMapping of a forest:\n" << joined(featureMapping);
   if (infoLogging()) LOG(INFO) << "inputKeys of a forest:\n" << joined(forest_->inputKeys);
 
-  buildEnsemble();
+  buildEnsemble(kernel);
   buildFeatureIndex(featureMapping);
 
   if (featureMapping.empty()) {
@@ -47,18 +47,18 @@ BoostingModel::BoostingModel(const std::string& serializedModel) {
 
 BoostingModel::~BoostingModel() = default;
 
-void BoostingModel::buildEnsemble() {
+void BoostingModel::buildEnsemble(WalkKernel kernel) {
   const size_t keys = forest_->inputKeys.size();
   if (keys >= 1 && keys <= 32765) {
     LOG(INFO) << "Using 16 bit version";
-    ensemble_ = std::make_unique<FastTreeEnsembleOOP<short, unsigned int>>();
+    ensemble_ = std::make_unique<FastTreeEnsembleOOP<short, unsigned int>>(kernel);
   } else {
     if (keys == 0) {
       LOG(ERROR) << "Forest doesn't have input keys information. "
                  << "Falling back to safer 32 bit version";
     }
     LOG(INFO) << "Using 32 bit version";
-    ensemble_ = std::make_unique<FastTreeEnsembleOOP<int, unsigned int>>();
+    ensemble_ = std::make_unique<FastTreeEnsembleOOP<int, unsigned int>>(kernel);
   }
   // A decreasing modelIndexMap is logged by init(); the model is used as is.
   ensemble_->init(forest_.get(), false);

@@ -37,7 +37,8 @@ namespace thornvale {
 
 class BoostingModel {
  public:
-  explicit BoostingModel(const std::string& serializedModel);
+  // The compiled forest scores with `kernel` (FastTreeEnsembleOOP).
+  explicit BoostingModel(const std::string& serializedModel, WalkKernel kernel = bestWalkKernel());
   ~BoostingModel();
   BoostingModel(const BoostingModel&) = delete;
   BoostingModel& operator=(const BoostingModel&) = delete;
@@ -62,7 +63,7 @@ class BoostingModel {
  private:
   static constexpr uint32_t kNoPosition = UINT32_MAX;
 
-  void buildEnsemble();
+  void buildEnsemble(WalkKernel kernel);
   void buildFeatureIndex(const std::vector<uint32_t>& featureMapping);
   uint32_t positionOf(int32_t id) const;
   void fillVector(const FeatureMap& features, std::vector<float>& vector) const;
