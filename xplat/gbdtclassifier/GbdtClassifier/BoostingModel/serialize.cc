@@ -79,7 +79,11 @@ class RecordBytes {
     const size_t avail = n_ - pos_;
     T v;
     if (avail >= sizeof(T)) {
+#if defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
+      std::memcpy(&v, p_ + pos_, sizeof(T));  // the record's byte order
+#else
       v = loadPrefix<T>(p_ + pos_, sizeof(T));
+#endif
       pos_ += sizeof(T);
     } else {
       v = loadPrefix<T>(p_ + pos_, avail);
