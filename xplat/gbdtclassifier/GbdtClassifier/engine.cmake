@@ -17,6 +17,7 @@ foreach(test IN ITEMS
     BoostingModel/serialize_test
     BoostingModel/ModelWriter_test
     BoostingModel/BoostingModel_test
+    CompleteTreeWalk_test
     FastTreeEnsemble_test)
   get_filename_component(name ${test} NAME)
   reliqa_test(gbdt_${name} SOURCES ${test}.cc LIBS gbdt)
