@@ -621,11 +621,19 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, 
       n.child = static_cast<NodeIndexT>(first);
       if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
       requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
-      nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
-      nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
+      // Field by field: a whole temporary copied in would be read back
+      // before its parts are stored, which stalls the loads.
+      nodes.resize(first + 2);
+      nodes[first].featureId = kUnfilled;
+      nodes[first + 1].featureId = kUnfilled;
       const uint32_t below = p.depth == UINT32_MAX ? p.depth : p.depth + 1;
-      pending.push_back({split.right.get(), first + 1, below});
-      p = Pending{split.left.get(), first, below};
+      Pending& right = pending.emplace_back();
+      right.node = split.right.get();
+      right.slot = first + 1;
+      right.depth = below;
+      p.node = split.left.get();
+      p.slot = first;
+      p.depth = below;
     }
   }
   out.nodes.assign(nodes.begin(), nodes.end());
