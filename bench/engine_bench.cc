@@ -5,12 +5,15 @@
 // level a node is a leaf with probability 0.2), as trainers produce them.
 //
 //   Score/<model>/<bits>      unnormalizedScore with the CPU's best kernel
-//   ScoreScalar/<model>/<bits>    the same with the scalar group walk
+//   ScoreScalar/<model>/<bits>    the same with the scalar walk of complete
+//                                 trees, which CPUs without AVX-512 run
 //   ScorePortable/<model>/<bits>  the same with 8 compiled trees in lock step
 //   OneByOne/<model>/<bits>   the same sum, one tree after another
 //   Predict/<model>/<bits>    BoostingModel::predict on a FeatureMap, INFO off
-//   Load/<model>              read + compile (BoostingModel construction;
-//                             the destruction of each model is not timed)
+//   Load/<model>              read + compile (BoostingModel construction for
+//                             this CPU's walk; the destruction of each model
+//                             is not timed)
+// gather_MB is the size of the copy of the trees that the kernel walks.
 #include <benchmark/benchmark.h>
 #include <glog/logging.h>
 
