@@ -104,12 +104,12 @@ void score(benchmark::State& state, const Shape* shape, bool sixteenBit, bool in
 template <typename Ensemble>
 void scoreWith(benchmark::State& state, const Shape* shape, WalkKernel kernel) {
   Fixture& f = fixture(*shape, sizeof(typename Ensemble::FlatNode{}.featureId) == 2);
-  Ensemble e;
-  e.init(&f.forest, false);
-  if (!e.useWalkKernel(kernel)) {
+  if (!walkKernelSupported(kernel)) {
     state.SkipWithError("this CPU cannot run the kernel");
     return;
   }
+  Ensemble e(kernel);  // lays the trees out for that kernel only
+  e.init(&f.forest, false);
   size_t i = 0;
   for (auto _ : state) benchmark::DoNotOptimize(e.unnormalizedScore(f.vectors[i++ % kVectors]));
   state.counters["gather_MB"] = static_cast<double>(e.gatherBytes()) / 1e6;

@@ -9,7 +9,7 @@
 // leaf above that depth becomes splits on a feature slot that always holds
 // NaN whose leaves all carry its value, so either way leads to it.
 //
-// Features and thresholds are compared as unsigned keys (completeKey()) that
+// Features and thresholds are compared as unsigned keys (completeKeyOfBits()) that
 // order as the floats do, so that a step is one node load, one feature load,
 // an integer compare and an add with carry. The plain walk's NaN rule (at the
 // root, the second child unless x <= t; below it, the second child when
@@ -35,7 +35,7 @@ struct CompleteSplit {
   // Position in the keys (the NaN slot for padding); at the root, the number
   // of slots plus the position.
   uint32_t feature;
-  uint32_t threshold;  // completeKey() of the threshold
+  uint32_t threshold;  // completeThresholdKey() or, at the root, completeRootThresholdKey()
 };
 static_assert(sizeof(CompleteSplit) == 8, "complete-tree splits are two words");
 
@@ -52,7 +52,6 @@ inline uint32_t bitsOf(float v) {
   return bits;
 }
 inline bool isNaNBits(uint32_t bits) { return (bits & 0x7FFFFFFFu) > 0x7F800000u; }
-inline uint32_t completeKey(float v) { return completeKeyOfBits(bitsOf(v)); }
 
 // Keys of a feature value below the root and at the root, and of a threshold
 // below the root and at the root; see above for NaN.
@@ -64,8 +63,14 @@ inline uint32_t completeRootFeatureKey(float v) {
   const uint32_t bits = bitsOf(v);
   return isNaNBits(bits) ? UINT32_MAX : completeKeyOfBits(bits);
 }
-inline uint32_t completeThresholdKey(float t) { return t != t ? UINT32_MAX : completeKey(t); }
-inline uint32_t completeRootThresholdKey(float t) { return t != t ? 0 : completeKey(t); }
+inline uint32_t completeThresholdKey(float t) {
+  const uint32_t bits = bitsOf(t);
+  return isNaNBits(bits) ? UINT32_MAX : completeKeyOfBits(bits);
+}
+inline uint32_t completeRootThresholdKey(float t) {
+  const uint32_t bits = bitsOf(t);
+  return isNaNBits(bits) ? 0 : completeKeyOfBits(bits);
+}
 
 // Fills keys[0, slots) with the keys of features[0, slots - 1) and of NaN
 // (the NaN slot, at slots - 1), and keys[slots, 2 * slots) with their root

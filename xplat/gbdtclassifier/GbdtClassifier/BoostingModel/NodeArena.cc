@@ -1,11 +1,15 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/NodeArena.h"
 
+#include <algorithm>
 #include <new>
 
 namespace thornvale {
 
 namespace {
-constexpr size_t kSlabBytes = 64 * 1024;
+// An arena's slabs double from the first size to the largest, so that a
+// small tree costs little and a large model few allocations.
+constexpr size_t kFirstSlabBytes = 1024;
+constexpr size_t kLargestSlabBytes = 64 * 1024;
 constexpr size_t kAlign = NodeArena::kNodeAlign;
 constexpr size_t kPrefix = kAlign;  // the slab word, padded to keep blocks aligned
 constexpr size_t kHeader = 64;      // the slab's count, then blocks
@@ -21,6 +25,7 @@ struct NodeArena::Slab {
   std::atomic<uint32_t> live{kUnretired};
 };
 static_assert(sizeof(NodeArena::Slab) <= kHeader && kHeader % kAlign == 0, "the slab header fits");
+static_assert(kHeader + kPrefix + NodeArena::kMaxNodeBytes <= kFirstSlabBytes, "every node fits a slab");
 
 namespace {
 void dropSlab(NodeArena::Slab* slab) {
@@ -34,10 +39,12 @@ void* NodeArena::allocate(size_t bytes) {
   const size_t need = kPrefix + roundUp(bytes);
   if (slab_ == nullptr || static_cast<size_t>(end_ - next_) < need) {
     retire();
-    void* raw = ::operator new(kSlabBytes);
+    const size_t slabBytes = slabBytes_ == 0 ? kFirstSlabBytes : std::min(2 * slabBytes_, kLargestSlabBytes);
+    void* raw = ::operator new(slabBytes);
+    slabBytes_ = slabBytes;
     slab_ = new (raw) Slab;
     next_ = static_cast<char*>(raw) + kHeader;
-    end_ = static_cast<char*>(raw) + kSlabBytes;
+    end_ = static_cast<char*>(raw) + slabBytes;
     handedOut_ = 0;
   }
   char* block = next_;

@@ -1,7 +1,7 @@
-// Storage for tree nodes: a NodeArena hands out node memory from 64 KiB
-// slabs, so that reading a model of a million nodes costs a few hundred
-// allocations instead of a million, and the nodes of a tree lie side by side
-// in the order they were read.
+// Storage for tree nodes: a NodeArena hands out node memory from slabs that
+// grow from 1 KiB to 64 KiB, so that reading a model of a million nodes costs
+// a few hundred allocations instead of a million, and the nodes of a tree lie
+// side by side in the order they were read.
 //
 // Every node block starts with an 8-byte word that names its slab, or is
 // null for a block from the heap, so that a node is freed the same way
@@ -44,6 +44,7 @@ class NodeArena {
   char* next_ = nullptr;
   char* end_ = nullptr;
   uint32_t handedOut_ = 0;  // blocks of slab_ given out so far
+  size_t slabBytes_ = 0;    // size of the latest slab
 };
 
 // Memory for a node of `bytes` bytes from the heap, freed by releaseNode().

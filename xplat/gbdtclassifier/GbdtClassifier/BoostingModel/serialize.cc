@@ -288,6 +288,7 @@ class Reader {
 
   Lines lines_;
   std::string buf_;
+  NodeArena arena_;  // every node of the model
 };
 
 int32_t parseHeader(const std::string& decoded) {
@@ -334,7 +335,6 @@ void Reader::readTrees(Forest& forest, int32_t version) {
   lines_.require(count, count, "trees");
   forest.trees.reserve(count);
   std::string scratch;
-  NodeArena arena;
   for (uint32_t i = 0; i < count; ++i) {
     WeightedTree entry;
     readTree(
@@ -343,7 +343,7 @@ void Reader::readTrees(Forest& forest, int32_t version) {
           return "tree " + std::to_string(i) + " (of " + std::to_string(count) +
                  ", counting from 0)";
         },
-        scratch, arena);
+        scratch, arena_);
     forest.trees.push_back(std::move(entry));
   }
 }
@@ -394,9 +394,8 @@ void Reader::readTrailer(Forest& forest, int32_t version) {
   if (readValue<int32_t>() != kModelMagic) return;
   WeightedTree selector;
   std::string scratch;
-  NodeArena arena;
   readTree(lines_.next(), selector, version, [] { return std::string("model selector tree"); },
-           scratch, arena);
+           scratch, arena_);
   forest.modelSelector = std::move(selector);
 
   const auto count = readValue<uint32_t>();
