@@ -124,7 +124,6 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   };
 
   static constexpr FeatureIdT kLeaf = -1;
-  static constexpr FeatureIdT kUnfilled = -2;
   // Largest feature id a split may carry.
   static constexpr int64_t kMaxFeatureId = std::numeric_limits<FeatureIdT>::max() - 1;
   // A first-child index at or above this cannot be stored.
@@ -574,12 +573,14 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, 
                                                               FlatTree& out, size_t tree,
                                                               CompileScratch& scratch) {
   std::vector<Pending>& pending = scratch.pending;
+  // The buffer grows ahead of need, so that adding a split's children is two
+  // stores and no call; `used` is its part that holds this tree.
   std::vector<FlatNode>& nodes = scratch.nodes;
-  nodes.clear();
+  if (nodes.size() < 64) nodes.resize(64);
+  size_t used = 1;
   out.hasEqualityFeature = false;
   out.depth = 0;
   out.leafDepth = std::numeric_limits<uint32_t>::max();
-  nodes.push_back(FlatNode{kUnfilled, 0, 0.0f});
   // Depth first: go down each left spine at once, keeping right children for
   // later, so that left subtrees are laid out before right ones.
   pending.assign(1, Pending{&root, 0, 0});
@@ -595,6 +596,7 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, 
       if (node->isLeaf()) {
         out.leafDepth = std::min(out.leafDepth, p.depth);
         nodes[p.slot].featureId = kLeaf;
+        nodes[p.slot].child = 0;
         nodes[p.slot].value =
             static_cast<float>(static_cast<const ConstantNode*>(node)->value * scale);
         break;
@@ -613,21 +615,21 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, 
         throw std::range_error("feature id > max size. Use large type for FeatureIdT");
       }
       const int32_t position = checkedPosition(id, tree);
-      const size_t first = nodes.size();
+      const size_t first = used;
       if (first >= kNodeIndexLimit) {
         throw std::range_error("node index > max size. Use large type for NodeIndexT");
       }
+      if (first + 2 > nodes.size()) nodes.resize(2 * nodes.size());
+      used = first + 2;
       FlatNode& n = nodes[p.slot];
       n.featureId = static_cast<FeatureIdT>(position);
       n.value = static_cast<float>(split.pivotValue);
       n.child = static_cast<NodeIndexT>(first);
       if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
       requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
-      // Field by field: a whole temporary copied in would be read back
-      // before its parts are stored, which stalls the loads.
-      nodes.resize(first + 2);
-      nodes[first].featureId = kUnfilled;
-      nodes[first + 1].featureId = kUnfilled;
+      // The children's slots are written when the walk reaches them. The
+      // work item is written field by field: a whole temporary copied in
+      // would be read back before its parts are stored, which stalls loads.
       const uint32_t below = p.depth == UINT32_MAX ? p.depth : p.depth + 1;
       Pending& right = pending.emplace_back();
       right.node = split.right.get();
@@ -638,7 +640,7 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, 
       p.depth = below;
     }
   }
-  out.nodes.assign(nodes.begin(), nodes.end());
+  out.nodes.assign(nodes.begin(), nodes.begin() + static_cast<ptrdiff_t>(used));
 }
 
 }  // namespace thornvale

@@ -11,10 +11,9 @@ namespace {
 constexpr size_t kFirstSlabBytes = 1024;
 constexpr size_t kLargestSlabBytes = 64 * 1024;
 constexpr size_t kAlign = NodeArena::kNodeAlign;
-constexpr size_t kPrefix = kAlign;  // the slab word, padded to keep blocks aligned
+constexpr size_t kPrefix = NodeArena::kPrefix;
 constexpr size_t kHeader = 64;      // the slab's count, then blocks
 
-constexpr size_t roundUp(size_t n) { return (n + kAlign - 1) / kAlign * kAlign; }
 }  // namespace
 
 // A slab's count starts at kUnretired, so that frees cannot bring it to zero
@@ -34,24 +33,17 @@ void dropSlab(NodeArena::Slab* slab) {
 }
 }  // namespace
 
-void* NodeArena::allocate(size_t bytes) {
+void* NodeArena::allocateSlow(size_t bytes) {
   if (bytes > kMaxNodeBytes) throw std::bad_alloc();
-  const size_t need = kPrefix + roundUp(bytes);
-  if (slab_ == nullptr || static_cast<size_t>(end_ - next_) < need) {
-    retire();
-    const size_t slabBytes = slabBytes_ == 0 ? kFirstSlabBytes : std::min(2 * slabBytes_, kLargestSlabBytes);
-    void* raw = ::operator new(slabBytes);
-    slabBytes_ = slabBytes;
-    slab_ = new (raw) Slab;
-    next_ = static_cast<char*>(raw) + kHeader;
-    end_ = static_cast<char*>(raw) + slabBytes;
-    handedOut_ = 0;
-  }
-  char* block = next_;
-  next_ += need;
-  ++handedOut_;
-  *reinterpret_cast<Slab**>(block) = slab_;
-  return block + kPrefix;
+  retire();
+  const size_t slabBytes = slabBytes_ == 0 ? kFirstSlabBytes : std::min(2 * slabBytes_, kLargestSlabBytes);
+  void* raw = ::operator new(slabBytes);
+  slabBytes_ = slabBytes;
+  slab_ = new (raw) Slab;
+  next_ = static_cast<char*>(raw) + kHeader;
+  end_ = static_cast<char*>(raw) + slabBytes;
+  handedOut_ = 0;
+  return allocate(bytes);  // fits: every node fits an empty slab
 }
 
 void NodeArena::retire() noexcept {
@@ -72,17 +64,46 @@ void* allocateNodeOnHeap(size_t bytes) {
   return block + kPrefix;
 }
 
+namespace {
+char* blockOf(void* node) { return static_cast<char*>(node) - kPrefix; }
+NodeArena::Slab* slabOf(const char* block) { return *reinterpret_cast<NodeArena::Slab* const*>(block); }
+
+// Counts `n` blocks of `slab` as freed; the last one frees the slab.
+void dropBlocks(NodeArena::Slab* slab, uint32_t n) noexcept {
+  if (slab->live.fetch_sub(n, std::memory_order_acq_rel) == n) dropSlab(slab);
+}
+}  // namespace
+
 void releaseNode(void* node) noexcept {
   if (node == nullptr) return;
-  char* block = static_cast<char*>(node) - kPrefix;
-  auto* slab = *reinterpret_cast<NodeArena::Slab**>(block);
+  char* block = blockOf(node);
+  NodeArena::Slab* slab = slabOf(block);
   if (slab == nullptr) {
     ::operator delete(block);
     return;
   }
-  if (slab->live.fetch_sub(1, std::memory_order_acq_rel) == 1) {
-    dropSlab(slab);
+  dropBlocks(slab, 1);
+}
+
+void ReleaseBatch::release(void* node) noexcept {
+  if (node == nullptr) return;
+  char* block = blockOf(node);
+  NodeArena::Slab* slab = slabOf(block);
+  if (slab == nullptr) {
+    ::operator delete(block);
+  } else if (slab == slab_) {
+    ++count_;
+  } else {
+    settle();
+    slab_ = slab;
+    count_ = 1;
   }
+}
+
+void ReleaseBatch::settle() noexcept {
+  if (count_ != 0) dropBlocks(slab_, count_);
+  slab_ = nullptr;
+  count_ = 0;
 }
 
 }  // namespace thornvale

@@ -29,15 +29,27 @@ class NodeArena {
 
   // Memory for a node of `bytes` bytes (at most kMaxNodeBytes), aligned for
   // any node.
-  void* allocate(size_t bytes);
+  void* allocate(size_t bytes) {
+    const size_t need = kPrefix + (bytes + kNodeAlign - 1) / kNodeAlign * kNodeAlign;
+    if (bytes > kMaxNodeBytes || static_cast<size_t>(end_ - next_) < need) return allocateSlow(bytes);
+    char* block = next_;
+    next_ += need;
+    ++handedOut_;
+    *reinterpret_cast<Slab**>(block) = slab_;
+    return block + kPrefix;
+  }
 
   static constexpr size_t kMaxNodeBytes = 256;
   // Alignment of every node block.
   static constexpr size_t kNodeAlign = 8;
+  // Bytes before each block: the slab word, padded to keep blocks aligned.
+  static constexpr size_t kPrefix = kNodeAlign;
 
   struct Slab;  // defined with the allocator
 
  private:
+  // allocate() when the current slab is full or there is none.
+  void* allocateSlow(size_t bytes);
   void retire() noexcept;
 
   Slab* slab_ = nullptr;
@@ -51,5 +63,25 @@ class NodeArena {
 void* allocateNodeOnHeap(size_t bytes);
 // Frees a block from NodeArena::allocate() or allocateNodeOnHeap().
 void releaseNode(void* block) noexcept;
+
+// Frees many blocks as releaseNode() does, with one update of a slab's count
+// per run of blocks from that slab instead of one per block: the nodes of a
+// tree lie side by side, so freeing a tree touches few counts. Blocks of the
+// pending run are settled by the destructor. One thread uses a batch.
+class ReleaseBatch {
+ public:
+  ReleaseBatch() = default;
+  ReleaseBatch(const ReleaseBatch&) = delete;
+  ReleaseBatch& operator=(const ReleaseBatch&) = delete;
+  ~ReleaseBatch() { settle(); }
+
+  void release(void* block) noexcept;
+
+ private:
+  void settle() noexcept;
+
+  NodeArena::Slab* slab_ = nullptr;
+  uint32_t count_ = 0;  // blocks of slab_ released but not yet counted
+};
 
 }  // namespace thornvale
