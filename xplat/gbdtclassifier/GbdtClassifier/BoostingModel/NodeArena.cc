@@ -85,19 +85,14 @@ void releaseNode(void* node) noexcept {
   dropBlocks(slab, 1);
 }
 
-void ReleaseBatch::release(void* node) noexcept {
-  if (node == nullptr) return;
-  char* block = blockOf(node);
-  NodeArena::Slab* slab = slabOf(block);
+void ReleaseBatch::startRun(void* node, NodeArena::Slab* slab) noexcept {
   if (slab == nullptr) {
-    ::operator delete(block);
-  } else if (slab == slab_) {
-    ++count_;
-  } else {
-    settle();
-    slab_ = slab;
-    count_ = 1;
+    ::operator delete(blockOf(node));
+    return;
   }
+  settle();
+  slab_ = slab;
+  count_ = 1;
 }
 
 void ReleaseBatch::settle() noexcept {

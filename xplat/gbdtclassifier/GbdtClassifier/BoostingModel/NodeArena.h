@@ -75,9 +75,19 @@ class ReleaseBatch {
   ReleaseBatch& operator=(const ReleaseBatch&) = delete;
   ~ReleaseBatch() { settle(); }
 
-  void release(void* block) noexcept;
+  void release(void* block) noexcept {
+    if (block == nullptr) return;
+    NodeArena::Slab* slab = *reinterpret_cast<NodeArena::Slab**>(static_cast<char*>(block) - NodeArena::kPrefix);
+    if (slab != nullptr && slab == slab_) {
+      ++count_;
+    } else {
+      startRun(block, slab);
+    }
+  }
 
  private:
+  // release() of a heap block or of the first block of a run.
+  void startRun(void* block, NodeArena::Slab* slab) noexcept;
   void settle() noexcept;
 
   NodeArena::Slab* slab_ = nullptr;
