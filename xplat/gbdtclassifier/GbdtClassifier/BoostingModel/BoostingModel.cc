@@ -30,7 +30,7 @@ std::string joined(const List& items) {
 }  // namespace
 
 BoostingModel::BoostingModel(const std::string& serializedModel, WalkKernel kernel) {
-  forest_ = deserialize(std::string_view(serializedModel));
+  forest_ = deserialize(std::string_view(serializedModel), nodes_);
 
   const std::vector<uint32_t> featureMapping = forest_->featureMapping;
   if (infoLogging()) LOG(INFO) << "featureMapping of a forest:\n" << joined(featureMapping);
@@ -45,7 +45,14 @@ BoostingModel::BoostingModel(const std::string& serializedModel, WalkKernel kern
   }
 }
 
-BoostingModel::~BoostingModel() = default;
+BoostingModel::~BoostingModel() {
+  // nodes_ frees every node at once when it goes, right after forest_: the
+  // trees let go of their nodes here so that they are not freed one by one.
+  for (WeightedTree& entry : forest_->trees) {
+    if (entry.tree) static_cast<void>(entry.tree->root.release());
+  }
+  if (forest_->modelSelector.tree) static_cast<void>(forest_->modelSelector.tree->root.release());
+}
 
 void BoostingModel::buildEnsemble(WalkKernel kernel) {
   const size_t keys = forest_->inputKeys.size();

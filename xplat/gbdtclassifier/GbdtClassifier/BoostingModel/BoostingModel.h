@@ -18,8 +18,11 @@
 // model without featureMapping cannot see any feature, so its one raw score
 // is computed at construction and returned for every map.
 //
-// Owns its Forest and compiled forest. Immutable after construction:
-// predict() and rawScore() may run on several threads at once.
+// Owns its Forest and compiled forest. The Forest's nodes live in the
+// model's own arena and are freed with it all at once, so the Forest must not
+// be changed through getForest() (no node may be taken out of it). Immutable
+// after construction: predict() and rawScore() may run on several threads at
+// once.
 #pragma once
 
 #include <cstddef>
@@ -68,6 +71,7 @@ class BoostingModel {
   uint32_t positionOf(int32_t id) const;
   void fillVector(const FeatureMap& features, std::vector<float>& vector) const;
 
+  NodeArena nodes_{NodeArena::Lifetime::kArena};  // every node of forest_
   std::unique_ptr<Forest> forest_;
   std::unique_ptr<FastTreeEnsemble<float>> ensemble_;
   std::unordered_map<uint32_t, uint32_t> featureIndex_;

@@ -18,10 +18,12 @@ constexpr size_t kHeader = 64;      // the slab's count, then blocks
 
 // A slab's count starts at kUnretired, so that frees cannot bring it to zero
 // while its arena may still hand out blocks; retiring subtracts kUnretired
-// minus the blocks handed out.
+// minus the blocks handed out. An arena that keeps its slabs never retires
+// them that way, so their counts never reach zero.
 struct NodeArena::Slab {
   static constexpr uint32_t kUnretired = 1u << 31;
   std::atomic<uint32_t> live{kUnretired};
+  Slab* next = nullptr;  // the arena's kept slabs
 };
 static_assert(sizeof(NodeArena::Slab) <= kHeader && kHeader % kAlign == 0, "the slab header fits");
 static_assert(kHeader + kPrefix + NodeArena::kMaxNodeBytes <= kFirstSlabBytes, "every node fits a slab");
@@ -48,15 +50,25 @@ void* NodeArena::allocateSlow(size_t bytes) {
 
 void NodeArena::retire() noexcept {
   if (slab_ == nullptr) return;
-  const uint32_t drop = Slab::kUnretired - handedOut_;
-  if (slab_->live.fetch_sub(drop, std::memory_order_acq_rel) == drop) {
-    dropSlab(slab_);
+  if (lifetime_ == Lifetime::kArena) {
+    slab_->next = kept_;
+    kept_ = slab_;
+  } else {
+    const uint32_t drop = Slab::kUnretired - handedOut_;
+    if (slab_->live.fetch_sub(drop, std::memory_order_acq_rel) == drop) dropSlab(slab_);
   }
   slab_ = nullptr;
   next_ = end_ = nullptr;
 }
 
-NodeArena::~NodeArena() { retire(); }
+NodeArena::~NodeArena() {
+  retire();
+  while (kept_ != nullptr) {
+    Slab* next = kept_->next;
+    dropSlab(kept_);
+    kept_ = next;
+  }
+}
 
 void* allocateNodeOnHeap(size_t bytes) {
   char* block = static_cast<char*>(::operator new(kPrefix + bytes));

@@ -10,6 +10,11 @@
 // destroyed) and every node in it has been freed, on whichever thread.
 // Nodes may outlive their arena.
 //
+// An arena made with Lifetime::kArena keeps its slabs instead and frees them
+// all when it is destroyed, whether their nodes were freed or not: freeing a
+// million nodes one by one costs as much as reading them. Its owner must let
+// no node outlive it; nodes freed before then are merely counted.
+//
 // Threads: one arena is used by one thread at a time; releaseNode() may run
 // on any thread. allocate() throws std::bad_alloc.
 #pragma once
@@ -22,7 +27,13 @@ namespace thornvale {
 
 class NodeArena {
  public:
-  NodeArena() = default;
+  // When slabs go back to the heap.
+  enum class Lifetime {
+    kNodes,  // once the arena has moved on and all their nodes are freed
+    kArena,  // with the arena, all at once
+  };
+
+  explicit NodeArena(Lifetime lifetime = Lifetime::kNodes) : lifetime_(lifetime) {}
   NodeArena(const NodeArena&) = delete;
   NodeArena& operator=(const NodeArena&) = delete;
   ~NodeArena();
@@ -52,6 +63,8 @@ class NodeArena {
   void* allocateSlow(size_t bytes);
   void retire() noexcept;
 
+  Lifetime lifetime_;
+  Slab* kept_ = nullptr;  // with Lifetime::kArena: the retired slabs, linked
   Slab* slab_ = nullptr;
   char* next_ = nullptr;
   char* end_ = nullptr;

@@ -51,6 +51,33 @@ TEST(NodeArena, BatchesFreeInterleavedRunsOfSeveralSlabs) {
   batch.release(nullptr);
 }
 
+// An arena that keeps its slabs frees them all when it goes: nodes freed
+// before (one by one or in batches) are only counted, and the nodes still in
+// use then are gone with it without a destructor call.
+TEST(NodeArena, ArenaLifetimeFreesEverySlabWithTheArena) {
+  std::vector<std::unique_ptr<Node>> trees;
+  NodeArena arena(NodeArena::Lifetime::kArena);
+  for (int t = 0; t < 300; ++t) {  // several slabs
+    std::unique_ptr<LinearNode> root(new (arena) LinearNode(t, 0.5));
+    root->left.reset(new (arena) ConstantNode(t));
+    root->right.reset(t % 2 ? new ConstantNode(-t) : new (arena) ConstantNode(-t));
+    trees.push_back(std::move(root));
+  }
+  for (size_t t = 0; t < trees.size(); t += 3) trees[t].reset();
+  for (auto& tree : trees) {
+    // Heap nodes are the owner's to free; the arena's go with it.
+    if (!tree) continue;
+    auto& split = static_cast<LinearNode&>(*tree);
+    if (split.pivotIndex % 2) {
+      split.right.reset();
+    } else {
+      static_cast<void>(split.right.release());
+    }
+    static_cast<void>(split.left.release());
+    static_cast<void>(tree.release());
+  }
+}
+
 // Nodes from an arena and from the heap mixed in one tree, freed through
 // unique_ptr after the arena is gone, some on other threads.
 TEST(NodeArena, NodesOutliveTheirArenaAndMayBeFreedAnywhere) {

@@ -265,7 +265,7 @@ class Lines {
 
 class Reader {
  public:
-  explicit Reader(std::string_view text) : lines_(text) {}
+  Reader(std::string_view text, NodeArena& arena) : lines_(text), arena_(arena) {}
 
   std::unique_ptr<Forest> read();
 
@@ -288,7 +288,7 @@ class Reader {
 
   Lines lines_;
   std::string buf_;
-  NodeArena arena_;  // every node of the model
+  NodeArena& arena_;  // every node of the model
 };
 
 int32_t parseHeader(const std::string& decoded) {
@@ -457,7 +457,12 @@ void deserialize_tree(const std::string& line, WeightedTree& out, int32_t versio
   readTree(line, out, version, [] { return std::string("tree"); }, scratch, arena);
 }
 
-std::unique_ptr<Forest> deserialize(std::string_view text) { return Reader(text).read(); }
+std::unique_ptr<Forest> deserialize(std::string_view text) {
+  NodeArena arena;
+  return deserialize(text, arena);
+}
+
+std::unique_ptr<Forest> deserialize(std::string_view text, NodeArena& arena) { return Reader(text, arena).read(); }
 
 std::unique_ptr<Forest> deserialize(std::istream& in) {
   const std::string text{std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};

@@ -61,6 +61,8 @@ struct Forest {
 std::unique_ptr<Forest> deserialize(std::istream& in);
 // Same, over a text in memory.
 std::unique_ptr<Forest> deserialize(std::string_view text);
+// Same, with every node drawn from `arena`.
+std::unique_ptr<Forest> deserialize(std::string_view text, NodeArena& arena);
 
 // Reads the header line; returns the version. Problems are only logged.
 int32_t is_header(std::istream& in);
