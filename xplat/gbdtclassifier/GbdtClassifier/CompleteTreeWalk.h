@@ -128,6 +128,9 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
                                    Takes takes) {
   CompleteForest out;
   bool any = false;
+  // First each group's trees and depth, then the arrays at their final size
+  // (padding splits read the NaN slot; absent trees have 0 leaves), then the
+  // trees in their places.
   for (size_t first = 0; first < trees.size(); first += kCompleteGroup) {
     const size_t end = std::min(trees.size(), first + kCompleteGroup);
     bool taken[kCompleteGroup] = {};
@@ -150,21 +153,31 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
         if (taken[i - first] && trees[i].depth == depth) taken[i - first] = false;
       }
     }
-    const size_t splitCount = (size_t{1} << depth) - 1;
-    const size_t leafCount = size_t{1} << depth;
     uint32_t mask = 0;
     for (size_t k = 0; k < kCompleteGroup; ++k) mask |= static_cast<uint32_t>(taken[k]) << k;
+    any = any || mask != 0;
+    const size_t splitStart = out.splitStart.empty()
+                                  ? 0
+                                  : out.splitStart.back() + kCompleteGroup * ((size_t{1} << out.depths.back()) - 1);
+    const size_t leafStart =
+        out.leafStart.empty() ? 0 : out.leafStart.back() + kCompleteGroup * (size_t{1} << out.depths.back());
     out.taken.push_back(mask);
     out.depths.push_back(depth);
-    out.splitStart.push_back(out.splits.size());
-    out.leafStart.push_back(out.leaves.size());
-    out.splits.resize(out.splits.size() + kCompleteGroup * splitCount, CompleteSplit{nanSlot, 0});
-    out.leaves.resize(out.leaves.size() + kCompleteGroup * leafCount, 0.0f);
-    for (size_t i = first; i < end; ++i) {
-      if (!taken[i - first]) continue;
-      any = true;
-      CompleteSplit* splits = out.splits.data() + out.splitStart.back() + (i - first) * splitCount;
-      float* leaves = out.leaves.data() + out.leafStart.back() + (i - first) * leafCount;
+    out.splitStart.push_back(splitStart);
+    out.leafStart.push_back(leafStart);
+  }
+  if (!any) return CompleteForest{};
+  const size_t lastDepth = out.depths.back();
+  out.splits.assign(out.splitStart.back() + kCompleteGroup * ((size_t{1} << lastDepth) - 1), CompleteSplit{nanSlot, 0});
+  out.leaves.assign(out.leafStart.back() + kCompleteGroup * (size_t{1} << lastDepth), 0.0f);
+  for (size_t g = 0; g < out.depths.size(); ++g) {
+    const size_t splitCount = (size_t{1} << out.depths[g]) - 1;
+    const size_t leafCount = size_t{1} << out.depths[g];
+    const size_t first = g * kCompleteGroup;
+    for (size_t i = first; i < std::min(trees.size(), first + kCompleteGroup); ++i) {
+      if ((out.taken[g] >> (i - first) & 1) == 0) continue;
+      CompleteSplit* splits = out.splits.data() + out.splitStart[g] + (i - first) * splitCount;
+      float* leaves = out.leaves.data() + out.leafStart[g] + (i - first) * leafCount;
       // Pairs of (compiled node, complete position), depth first.
       struct Place {
         size_t node;
@@ -194,7 +207,6 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
       }
     }
   }
-  if (!any) return CompleteForest{};
   return out;
 }
 
