@@ -92,6 +92,38 @@ TEST(Base64, EncoderOutputDecodesExactly) {
   }
 }
 
+// Every byte value in every place of a group, and runs of groups, against
+// the bit layout of base64 written out plainly.
+TEST(Base64, EveryCharacterInEveryPlaceOfAGroup) {
+  const std::string alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+  auto sixBits = [&](unsigned char c) -> unsigned {
+    const size_t at = alphabet.find(static_cast<char>(c));
+    return at == std::string::npos ? 0 : static_cast<unsigned>(at);
+  };
+  auto reference = [&](const std::string& text) {
+    std::string out;
+    for (size_t g = 0; g + 4 <= text.size(); g += 4) {
+      unsigned bits = 0;
+      for (size_t k = 0; k < 4; ++k) bits = bits << 6 | sixBits(static_cast<unsigned char>(text[g + k]));
+      out += static_cast<char>(bits >> 16);
+      out += static_cast<char>(bits >> 8 & 0xFF);
+      out += static_cast<char>(bits & 0xFF);
+    }
+    return out;
+  };
+  std::string text;
+  for (int c = 0; c < 256; ++c) {
+    if (c == '=') continue;  // padding is covered above
+    for (int place = 0; place < 4; ++place) {
+      std::string group = "w9+B";
+      group[place] = static_cast<char>(c);
+      ASSERT_EQ(base64_decode(group), reference(group)) << c << " at " << place;
+      text += group;
+    }
+  }
+  EXPECT_EQ(base64_decode(text), reference(text));
+}
+
 TEST(StreamReaders, ReadLinesOneAtATime) {
   std::istringstream in(base64_encode(Bytes().u32(7).u32(99).b) + "\n\n" +
                         base64_encode(Bytes().f64(-2.5).b) + "\n" +
