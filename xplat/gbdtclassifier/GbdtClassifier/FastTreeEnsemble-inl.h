@@ -224,7 +224,17 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
 
   void buildEqualityMask(const Forest& forest, bool remap);
-  int32_t checkedPosition(int32_t featureId, size_t tree) const;
+  // The position that a split on `featureId` reads.
+  int32_t checkedPosition(int32_t featureId, size_t tree) const {
+    // Without a featureMapping every position reads 0.0; a negative one is
+    // kept as 0.
+    if (featureMapping_.empty()) return featureId < 0 ? 0 : featureId;
+    if (featureId >= 0 && (remap_ || static_cast<uint64_t>(featureId) < featureMapping_.size())) {
+      return featureId;
+    }
+    throwBadPosition(featureId, tree);
+  }
+  [[noreturn]] void throwBadPosition(int32_t featureId, size_t tree) const;
   // What compileTree() reuses from tree to tree: its work list, and the nodes
   // of the tree being compiled, copied out at their final size.
   struct CompileScratch {
@@ -546,26 +556,14 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildEqualityMask(const Forest
 }
 
 template <typename FeatureIdT, typename NodeIndexT>
-int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::checkedPosition(int32_t featureId,
-                                                                     size_t tree) const {
-  if (featureMapping_.empty()) {
-    // Every position reads 0.0 in such a model; a negative one is kept as 0.
-    return featureId < 0 ? 0 : featureId;
-  }
+void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::throwBadPosition(int32_t featureId, size_t tree) const {
   if (remap_) {
-    if (featureId < 0) {
-      throw std::range_error("split in " + label(tree) + " tests feature id " +
-                             std::to_string(featureId) + " after remapping; ids must be 0 to " +
-                             std::to_string(kMaxFeatureId));
-    }
-    return featureId;
+    throw std::range_error("split in " + label(tree) + " tests feature id " + std::to_string(featureId) +
+                           " after remapping; ids must be 0 to " + std::to_string(kMaxFeatureId));
   }
-  if (featureId < 0 || static_cast<uint64_t>(featureId) >= featureMapping_.size()) {
-    throw std::range_error("split in " + label(tree) + " tests feature position " +
-                           std::to_string(featureId) + ", outside the feature vector of " +
-                           std::to_string(featureMapping_.size()) + " positions");
-  }
-  return featureId;
+  throw std::range_error("split in " + label(tree) + " tests feature position " +
+                         std::to_string(featureId) + ", outside the feature vector of " +
+                         std::to_string(featureMapping_.size()) + " positions");
 }
 
 template <typename FeatureIdT, typename NodeIndexT>
