@@ -2,6 +2,7 @@
 
 #include <double-conversion/double-conversion.h>
 
+#include <algorithm>
 #include <charconv>
 #include <climits>
 #include <cmath>
@@ -100,6 +101,57 @@ double readNonFiniteWord(std::string_view text, std::string_view& rest) {
   return negative ? -value : value;
 }
 
+// Writes a finite value in the layout described in NumberText.h. The shortest
+// round-trip digits (the closest to the value among the shortest, ties to even)
+// come from the standard library's scientific form, "-d.ddde-XX", which is then
+// laid out: positional for decimal exponents -6 to 20, "<d.ddd>E<exponent>"
+// outside.
+void appendShortestLayout(double value, std::string& out) {
+  char scientific[40];
+  const char* end = std::to_chars(scientific, scientific + sizeof scientific, value,
+                                  std::chars_format::scientific).ptr;
+  const char* p = scientific;
+  char text[40];
+  char* q = text;
+  if (*p == '-') *q++ = *p++;
+  // At most 17 significant digits.
+  char digits[17];
+  int length = 0;
+  digits[length++] = *p++;
+  if (*p == '.') {
+    for (++p; *p != 'e'; ++p) digits[length++] = *p;
+  }
+  ++p;  // 'e'
+  const bool negativeExponent = *p == '-';
+  ++p;  // the exponent's sign is always written
+  int exponent = 0;
+  for (; p < end; ++p) exponent = exponent * 10 + (*p - '0');
+  if (negativeExponent) exponent = -exponent;
+
+  if (exponent < -6 || exponent >= 21) {
+    *q++ = digits[0];
+    if (length > 1) {
+      *q++ = '.';
+      q = std::copy(digits + 1, digits + length, q);
+    }
+    *q++ = 'E';
+    q = std::to_chars(q, text + sizeof text, exponent).ptr;
+  } else if (exponent < 0) {
+    *q++ = '0';
+    *q++ = '.';
+    q = std::fill_n(q, -exponent - 1, '0');
+    q = std::copy(digits, digits + length, q);
+  } else if (exponent + 1 >= length) {
+    q = std::copy(digits, digits + length, q);
+    q = std::fill_n(q, exponent + 1 - length, '0');
+  } else {
+    q = std::copy(digits, digits + exponent + 1, q);
+    *q++ = '.';
+    q = std::copy(digits + exponent + 1, digits + length, q);
+  }
+  out.append(text, q);
+}
+
 }  // namespace
 
 void appendDoubleText(double value, std::string& out) {
@@ -117,10 +169,14 @@ void appendDoubleText(double value, std::string& out) {
       return;
     }
   }
-  char buffer[256];
-  StringBuilder builder(buffer, sizeof buffer);
-  shortestWriter().ToShortest(value, &builder);
-  out.append(buffer, static_cast<size_t>(builder.position()));
+  if (!std::isfinite(value)) {
+    char buffer[16];
+    StringBuilder builder(buffer, sizeof buffer);
+    shortestWriter().ToShortest(value, &builder);
+    out.append(buffer, static_cast<size_t>(builder.position()));
+    return;
+  }
+  appendShortestLayout(value, out);
 }
 
 std::string doubleToText(double value) {
