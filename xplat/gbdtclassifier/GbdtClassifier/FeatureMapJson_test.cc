@@ -11,6 +11,7 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
 namespace thornvale {
 namespace {
@@ -63,6 +64,26 @@ TEST(FeatureMapJsonTest, WrittenMapsReadBack) {
                       {2147483647, 1.0 / 3}, {-2147483647 - 1, 9007199254740992.0}};
   EXPECT_EQ(featureMapFromJson(featureMapToJson(features)), features);
   EXPECT_EQ(featureMapFromJson(" { } "), FeatureMap{});
+}
+
+// The writer sizes its text for the longest members before writing them:
+// members with the longest ids and numbers must all arrive, in map order.
+TEST(FeatureMapJsonTest, LongestMembersAreWrittenWhole) {
+  FeatureMap features;
+  for (int32_t i = 0; i < 300; ++i) {
+    // 25 characters each, e.g. -0.0000012345678901234567, and -1.2345678901234567E-300.
+    features.emplace(-2147483647 - 1 + i, -1.2345678901234567e-6 * (1.0 + i / 1e9));
+    features.emplace(2147483647 - i, -1.2345678901234567e-300 * (1.0 + i / 1e9));
+  }
+  std::string expected = "{";
+  for (const auto& [id, value] : features) {
+    if (expected.size() > 1) expected += ',';
+    expected += '"' + std::to_string(id) + "\":" + doubleToText(value);
+  }
+  expected += '}';
+  EXPECT_EQ(featureMapToJson(features), expected);
+  EXPECT_EQ(doubleToText(-1.2345678901234567e-6).size(), kMaxDoubleTextSize);
+  EXPECT_EQ(featureMapFromJson(expected), features);
 }
 
 TEST(FeatureMapJsonTest, NamesAreIntegersAndDuplicatesResolveByDocumentOrder) {

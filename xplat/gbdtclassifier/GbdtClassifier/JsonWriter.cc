@@ -27,23 +27,30 @@ std::string doubleToJson(double value) {
   return doubleToText(value);
 }
 
+// Each member is written straight into the text, which is sized for the
+// longest possible members first and cut to length at the end.
 std::string featureMapToJson(const FeatureMap& features) {
-  std::string json;
-  json.reserve(2 + features.size() * 24);
-  json += '{';
-  char id[16];
+  // "-2147483648": at most 11 characters for an id, 4 for quotes, colon, comma.
+  constexpr size_t kMaxMemberSize = 11 + 4 + kMaxDoubleTextSize;
+  std::string json(2 + features.size() * kMaxMemberSize, '\0');
+  char* const begin = json.data();
+  char* out = begin;
+  *out++ = '{';
   for (const auto& [featureId, value] : features) {
-    auto idEnd = std::to_chars(id, id + sizeof id, featureId).ptr;
     if (!std::isfinite(value)) {
+      char id[16];
+      char* idEnd = std::to_chars(id, id + sizeof id, featureId).ptr;
       requireFinite(value, "value at \"" + std::string(id, idEnd) + "\"");
     }
-    if (json.size() > 1) json += ',';
-    json += '"';
-    json.append(id, idEnd);
-    json += "\":";
-    appendDoubleText(value, json);
+    if (out != begin + 1) *out++ = ',';
+    *out++ = '"';
+    out = std::to_chars(out, out + 11, featureId).ptr;
+    *out++ = '"';
+    *out++ = ':';
+    out = writeDoubleText(value, out);
   }
-  json += '}';
+  *out++ = '}';
+  json.resize(static_cast<size_t>(out - begin));
   return json;
 }
 

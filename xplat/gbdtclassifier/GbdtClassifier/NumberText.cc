@@ -101,18 +101,17 @@ double readNonFiniteWord(std::string_view text, std::string_view& rest) {
   return negative ? -value : value;
 }
 
-// Writes a finite value in the layout described in NumberText.h. The shortest
+// Writes a finite value at `q` in the layout described in NumberText.h and
+// returns the end of the text. The shortest
 // round-trip digits (the closest to the value among the shortest, ties to even)
 // come from the standard library's scientific form, "-d.ddde-XX", which is then
 // laid out: positional for decimal exponents -6 to 20, "<d.ddd>E<exponent>"
 // outside.
-void appendShortestLayout(double value, std::string& out) {
+char* writeShortestLayout(double value, char* q) {
   char scientific[40];
   const char* end = std::to_chars(scientific, scientific + sizeof scientific, value,
                                   std::chars_format::scientific).ptr;
   const char* p = scientific;
-  char text[40];
-  char* q = text;
   if (*p == '-') *q++ = *p++;
   // At most 17 significant digits.
   char digits[17];
@@ -135,7 +134,7 @@ void appendShortestLayout(double value, std::string& out) {
       q = std::copy(digits + 1, digits + length, q);
     }
     *q++ = 'E';
-    q = std::to_chars(q, text + sizeof text, exponent).ptr;
+    q = std::to_chars(q, q + 4, exponent).ptr;
   } else if (exponent < 0) {
     *q++ = '0';
     *q++ = '.';
@@ -149,34 +148,34 @@ void appendShortestLayout(double value, std::string& out) {
     *q++ = '.';
     q = std::copy(digits + exponent + 1, digits + length, q);
   }
-  out.append(text, q);
+  return q;
 }
 
 }  // namespace
 
-void appendDoubleText(double value, std::string& out) {
+char* writeDoubleText(double value, char* out) {
+  char* const limit = out + kMaxDoubleTextSize;
   // Integral values below 2^53 are their own shortest round-trip digits, and
   // they are positional (below 1e21): the integer's decimal text is the same
   // text, much faster. -0.0 keeps its sign.
   if (value > -9007199254740992.0 && value < 9007199254740992.0) {
     const auto integer = static_cast<int64_t>(value);
     if (static_cast<double>(integer) == value) {
-      char digits[24];
-      char* end = digits;
-      if (integer == 0 && std::signbit(value)) *end++ = '-';
-      end = std::to_chars(end, digits + sizeof digits, integer).ptr;
-      out.append(digits, end);
-      return;
+      if (integer == 0 && std::signbit(value)) *out++ = '-';
+      return std::to_chars(out, limit, integer).ptr;
     }
   }
   if (!std::isfinite(value)) {
-    char buffer[16];
-    StringBuilder builder(buffer, sizeof buffer);
+    StringBuilder builder(out, static_cast<int>(kMaxDoubleTextSize));
     shortestWriter().ToShortest(value, &builder);
-    out.append(buffer, static_cast<size_t>(builder.position()));
-    return;
+    return out + builder.position();
   }
-  appendShortestLayout(value, out);
+  return writeShortestLayout(value, out);
+}
+
+void appendDoubleText(double value, std::string& out) {
+  char text[kMaxDoubleTextSize];
+  out.append(text, writeDoubleText(value, text));
 }
 
 std::string doubleToText(double value) {

@@ -15,6 +15,7 @@
 // All functions are pure and may be called from any thread.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <string>
 #include <string_view>
@@ -25,6 +26,13 @@ std::string doubleToText(double value);
 
 // Appends doubleToText(value) to `out`.
 void appendDoubleText(double value, std::string& out);
+
+// The longest text doubleToText writes: "-0.00000" and 17 digits.
+inline constexpr size_t kMaxDoubleTextSize = 25;
+
+// Writes doubleToText(value) at `out`, which has room for kMaxDoubleTextSize
+// characters, and returns the end of what it wrote.
+char* writeDoubleText(double value, char* out);
 
 double textToDouble(std::string_view text);
 
