@@ -66,14 +66,17 @@ TEST(FeatureMapJsonTest, WrittenMapsReadBack) {
   EXPECT_EQ(featureMapFromJson(" { } "), FeatureMap{});
 }
 
-// The writer sizes its text for the longest members before writing them:
-// members with the longest ids and numbers must all arrive, in map order.
+// The writer sizes its text for the longest members before writing them.
+// Here every member is as long as any can be (an 11-character id, a
+// 25-character number), so the text fills that size to its last byte: a
+// size one short would overrun, which the sanitizer builds report.
 TEST(FeatureMapJsonTest, LongestMembersAreWrittenWhole) {
   FeatureMap features;
-  for (int32_t i = 0; i < 300; ++i) {
-    // 25 characters each, e.g. -0.0000012345678901234567, and -1.2345678901234567E-300.
-    features.emplace(-2147483647 - 1 + i, -1.2345678901234567e-6 * (1.0 + i / 1e9));
-    features.emplace(2147483647 - i, -1.2345678901234567e-300 * (1.0 + i / 1e9));
+  for (int32_t i = 0; features.size() < 300; ++i) {
+    const double value = -1.2345678901234567e-6 * (1.0 + i / 1e9);  // -0.0000012345678901234567
+    if (doubleToText(value).size() == kMaxDoubleTextSize) {
+      features.emplace(-2147483647 - 1 + static_cast<int32_t>(features.size()), value);
+    }
   }
   std::string expected = "{";
   for (const auto& [id, value] : features) {
@@ -81,9 +84,10 @@ TEST(FeatureMapJsonTest, LongestMembersAreWrittenWhole) {
     expected += '"' + std::to_string(id) + "\":" + doubleToText(value);
   }
   expected += '}';
-  EXPECT_EQ(featureMapToJson(features), expected);
-  EXPECT_EQ(doubleToText(-1.2345678901234567e-6).size(), kMaxDoubleTextSize);
-  EXPECT_EQ(featureMapFromJson(expected), features);
+  const std::string json = featureMapToJson(features);
+  EXPECT_EQ(json, expected);
+  EXPECT_EQ(json.size(), 2 + features.size() * (11 + 4 + kMaxDoubleTextSize) - 1);
+  EXPECT_EQ(featureMapFromJson(json), features);
 }
 
 TEST(FeatureMapJsonTest, NamesAreIntegersAndDuplicatesResolveByDocumentOrder) {

@@ -166,9 +166,11 @@ char* writeDoubleText(double value, char* out) {
     }
   }
   if (!std::isfinite(value)) {
-    StringBuilder builder(out, static_cast<int>(kMaxDoubleTextSize));
+    // The builder ends its text with a NUL: it writes into its own buffer.
+    char text[kMaxDoubleTextSize + 1];
+    StringBuilder builder(text, sizeof text);
     shortestWriter().ToShortest(value, &builder);
-    return out + builder.position();
+    return std::copy(text, text + builder.position(), out);
   }
   return writeShortestLayout(value, out);
 }

@@ -19,10 +19,11 @@
 // is computed at construction and returned for every map.
 //
 // Owns its Forest and compiled forest. The Forest's nodes live in the
-// model's own arena and are freed with it all at once, so the Forest must not
-// be changed through getForest() (no node may be taken out of it). Immutable
-// after construction: predict() and rawScore() may run on several threads at
-// once.
+// model's own arena and are freed with it all at once, without their
+// destructors. getForest()'s const does not reach through the Forest's
+// pointers, but no node may be taken out of it (it would not outlive the
+// model) or put into it (it would never be freed). Immutable after
+// construction: predict() and rawScore() may run on several threads at once.
 #pragma once
 
 #include <cstddef>

@@ -12,7 +12,7 @@ constexpr size_t kFirstSlabBytes = 1024;
 constexpr size_t kLargestSlabBytes = 64 * 1024;
 constexpr size_t kAlign = NodeArena::kNodeAlign;
 constexpr size_t kPrefix = NodeArena::kPrefix;
-constexpr size_t kHeader = 64;      // the slab's count, then blocks
+constexpr size_t kHeader = 64;      // the Slab (count, link), then blocks
 
 }  // namespace
 
@@ -72,7 +72,7 @@ NodeArena::~NodeArena() {
 
 void* allocateNodeOnHeap(size_t bytes) {
   char* block = static_cast<char*>(::operator new(kPrefix + bytes));
-  *reinterpret_cast<void**>(block) = nullptr;
+  *reinterpret_cast<NodeArena::Slab**>(block) = nullptr;  // the same type that releasing reads
   return block + kPrefix;
 }
 

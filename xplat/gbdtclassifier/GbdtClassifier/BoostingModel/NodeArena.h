@@ -7,8 +7,8 @@
 // null for a block from the heap, so that a node is freed the same way
 // however it was made: Node's own operator delete calls releaseNode(). A slab
 // goes back to the heap when its arena has moved on from it (or is
-// destroyed) and every node in it has been freed, on whichever thread.
-// Nodes may outlive their arena.
+// destroyed) and every node in it has been freed, on whichever thread, so
+// nodes may outlive their arena.
 //
 // An arena made with Lifetime::kArena keeps its slabs instead and frees them
 // all when it is destroyed, whether their nodes were freed or not: freeing a

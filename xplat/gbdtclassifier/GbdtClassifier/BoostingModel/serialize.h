@@ -15,7 +15,7 @@
 // yields an empty Forest. deserialize() writes the line
 // "Deseralization version: <v>" to standard output.
 //
-// The reader keeps no state apart from its decode table, which is constant;
+// The reader keeps no state apart from its decode tables, which are constant;
 // separate streams may be read on separate threads. No step recurses per
 // tree level.
 #pragma once
@@ -61,7 +61,8 @@ struct Forest {
 std::unique_ptr<Forest> deserialize(std::istream& in);
 // Same, over a text in memory.
 std::unique_ptr<Forest> deserialize(std::string_view text);
-// Same, with every node drawn from `arena`.
+// Same, with every node drawn from `arena`. An arena of Lifetime::kArena
+// must outlive the Forest's nodes.
 std::unique_ptr<Forest> deserialize(std::string_view text, NodeArena& arena);
 
 // Reads the header line; returns the version. Problems are only logged.
