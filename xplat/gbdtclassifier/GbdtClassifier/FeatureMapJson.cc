@@ -4,7 +4,6 @@
 
 #include <cstdint>
 #include <limits>
-#include <optional>
 #include <string>
 #include <unordered_map>
 #include <utility>
@@ -172,35 +171,6 @@ struct Member {
   JsonScalar value;
 };
 
-// Finds a member by name. Stored maps are mostly a handful of members, which
-// a scan finds sooner than a hash map is built; larger objects get one.
-class MemberIndex {
- public:
-  std::optional<size_t> find(std::string_view name, const std::vector<Member>& members) const {
-    if (byName_.empty()) {
-      for (size_t i = 0; i < members.size(); ++i) {
-        if (members[i].name == name) return i;
-      }
-      return std::nullopt;
-    }
-    auto it = byName_.find(name);
-    return it == byName_.end() ? std::nullopt : std::optional<size_t>(it->second);
-  }
-
-  // `position` is the new member's index; names are added in member order.
-  void add(std::string_view name, size_t position, const std::vector<Member>& members) {
-    if (byName_.empty() && position < kMaxScanned) return;
-    if (byName_.empty()) {
-      for (size_t i = 0; i < position; ++i) byName_.emplace(members[i].name, i);
-    }
-    byName_.emplace(name, position);
-  }
-
- private:
-  static constexpr size_t kMaxScanned = 16;
-  std::unordered_map<std::string_view, size_t> byName_;
-};
-
 }  // namespace
 
 FeatureMap featureMapFromJson(std::string_view json) {
@@ -226,18 +196,18 @@ FeatureMap featureMapFromJson(std::string_view json) {
   ondemand::object object;
   if (auto error = document.get_object().get(object)) failParse(error);
   std::vector<Member> members;
-  MemberIndex index;
+  std::unordered_map<std::string_view, size_t> indexByName;
   for (auto fieldResult : object) {
     ondemand::field field;
     if (auto error = std::move(fieldResult).get(field)) failParse(error);
     std::string_view name;
     if (auto error = field.unescaped_key().get(name)) failParse(error);
     JsonScalar value = readValue(field.value());
-    if (std::optional<size_t> known = index.find(name, members)) {
-      members[*known].value = value;  // identical names: the last value counts
-    } else {
-      index.add(name, members.size(), members);
+    auto [it, inserted] = indexByName.emplace(name, members.size());
+    if (inserted) {
       members.push_back({name, value});
+    } else {
+      members[it->second].value = value;  // identical names: the last value counts
     }
   }
   // Past the object's closing brace there must be nothing but white space.

@@ -108,24 +108,6 @@ TEST(FeatureMapJsonTest, NamesAreIntegersAndDuplicatesResolveByDocumentOrder) {
   EXPECT_EQ(readError(R"({"":1})"), "Empty input string");
 }
 
-// The same rules in large objects, with repeated names far apart.
-TEST(FeatureMapJsonTest, DuplicatesResolveTheSameWayInLargeObjects) {
-  for (int members : {5, 15, 16, 17, 40}) {
-    std::string json = "{";
-    FeatureMap expected;
-    for (int i = 0; i < members; ++i) {
-      json += "\"" + std::to_string(i) + "\":" + std::to_string(i) + ",";
-      expected[i] = i;
-    }
-    // Identical names again: the last value counts; "00" names id 0 again, but
-    // the first member named "0" was earlier in the text and wins.
-    json += R"("0":-1,"00":-2,")" + std::to_string(members - 1) + R"(":-3})";
-    expected[0] = -1;
-    expected[members - 1] = -3;
-    EXPECT_EQ(featureMapFromJson(json), expected) << json;
-  }
-}
-
 TEST(FeatureMapJsonTest, IntegralNumbersGoThroughSixtyFourBitIntegers) {
   FeatureMap read = featureMapFromJson(R"({"1":-0,"2":0123,"3":18014398509481984,"4":-9223372036854775808})");
   EXPECT_EQ(read.at(1), 0.0);
