@@ -76,41 +76,15 @@ void* allocateNodeOnHeap(size_t bytes) {
   return block + kPrefix;
 }
 
-namespace {
-char* blockOf(void* node) { return static_cast<char*>(node) - kPrefix; }
-NodeArena::Slab* slabOf(const char* block) { return *reinterpret_cast<NodeArena::Slab* const*>(block); }
-
-// Counts `n` blocks of `slab` as freed; the last one frees the slab.
-void dropBlocks(NodeArena::Slab* slab, uint32_t n) noexcept {
-  if (slab->live.fetch_sub(n, std::memory_order_acq_rel) == n) dropSlab(slab);
-}
-}  // namespace
-
 void releaseNode(void* node) noexcept {
   if (node == nullptr) return;
-  char* block = blockOf(node);
-  NodeArena::Slab* slab = slabOf(block);
+  char* block = static_cast<char*>(node) - kPrefix;
+  auto* slab = *reinterpret_cast<NodeArena::Slab**>(block);
   if (slab == nullptr) {
     ::operator delete(block);
     return;
   }
-  dropBlocks(slab, 1);
-}
-
-void ReleaseBatch::startRun(void* node, NodeArena::Slab* slab) noexcept {
-  if (slab == nullptr) {
-    ::operator delete(blockOf(node));
-    return;
-  }
-  settle();
-  slab_ = slab;
-  count_ = 1;
-}
-
-void ReleaseBatch::settle() noexcept {
-  if (count_ != 0) dropBlocks(slab_, count_);
-  slab_ = nullptr;
-  count_ = 0;
+  if (slab->live.fetch_sub(1, std::memory_order_acq_rel) == 1) dropSlab(slab);
 }
 
 }  // namespace thornvale

@@ -77,34 +77,4 @@ void* allocateNodeOnHeap(size_t bytes);
 // Frees a block from NodeArena::allocate() or allocateNodeOnHeap().
 void releaseNode(void* block) noexcept;
 
-// Frees many blocks as releaseNode() does, with one update of a slab's count
-// per run of blocks from that slab instead of one per block: the nodes of a
-// tree lie side by side, so freeing a tree touches few counts. Blocks of the
-// pending run are settled by the destructor. One thread uses a batch.
-class ReleaseBatch {
- public:
-  ReleaseBatch() = default;
-  ReleaseBatch(const ReleaseBatch&) = delete;
-  ReleaseBatch& operator=(const ReleaseBatch&) = delete;
-  ~ReleaseBatch() { settle(); }
-
-  void release(void* block) noexcept {
-    if (block == nullptr) return;
-    NodeArena::Slab* slab = *reinterpret_cast<NodeArena::Slab**>(static_cast<char*>(block) - NodeArena::kPrefix);
-    if (slab != nullptr && slab == slab_) {
-      ++count_;
-    } else {
-      startRun(block, slab);
-    }
-  }
-
- private:
-  // release() of a heap block or of the first block of a run.
-  void startRun(void* block, NodeArena::Slab* slab) noexcept;
-  void settle() noexcept;
-
-  NodeArena::Slab* slab_ = nullptr;
-  uint32_t count_ = 0;  // blocks of slab_ released but not yet counted
-};
-
 }  // namespace thornvale

@@ -32,27 +32,8 @@ TEST(NodeArena, BlocksAreAlignedDistinctAndWritable) {
   EXPECT_THROW(arena.allocate(NodeArena::kMaxNodeBytes + 1), std::bad_alloc);
 }
 
-// A batch settles a slab's count once per run; runs from two arenas and heap
-// blocks interleaved, some settled before and some after their arena is gone.
-TEST(NodeArena, BatchesFreeInterleavedRunsOfSeveralSlabs) {
-  std::vector<void*> blocks;
-  auto a = std::make_unique<NodeArena>();
-  NodeArena b;
-  for (int i = 0; i < 3000; ++i) {
-    blocks.push_back(i % 5 == 0 ? allocateNodeOnHeap(24) : (i % 3 == 0 ? a->allocate(40) : b.allocate(56)));
-  }
-  {
-    ReleaseBatch batch;
-    for (size_t i = 0; i < blocks.size(); i += 2) batch.release(blocks[i]);
-    a.reset();  // slabs of `a` with blocks still pending in the batch
-  }
-  ReleaseBatch batch;
-  for (size_t i = blocks.size() - 1; i < blocks.size(); i -= 2) batch.release(blocks[i]);
-  batch.release(nullptr);
-}
-
 // An arena that keeps its slabs frees them all when it goes: nodes freed
-// before (one by one or in batches) are only counted, and the nodes still in
+// before are only counted, and the nodes still in
 // use then are gone with it without a destructor call.
 TEST(NodeArena, ArenaLifetimeFreesEverySlabWithTheArena) {
   std::vector<std::unique_ptr<Node>> trees;

@@ -32,64 +32,25 @@ const Node* walkToLeaf(const Node* node, const std::vector<double>& features) {
   return node;
 }
 
-// Subtrees are destroyed without recursion and without allocating, and their
-// memory goes back through one batch, which settles each slab's count once
-// per run of nodes from it.
-template <typename NodeT>
-void destroyNode(NodeT* node, ReleaseBatch& batch) noexcept {
-  node->~NodeT();  // NodeT is final: no virtual call; its children are gone
-  batch.release(node);
-}
-
-// Any depth: splits whose left child is a split are rotated right until the
-// left child is a leaf, which is then freed together with the split; the walk
-// continues down the right spine. Every node is rotated at most once.
-void destroyByRotation(Node* cur, ReleaseBatch& batch) noexcept {
-  while (cur != nullptr) {
-    if (cur->isLeaf()) {
-      destroyNode(static_cast<ConstantNode*>(cur), batch);
-      return;
-    }
-    auto* split = static_cast<LinearNode*>(cur);
+// Destroys a subtree without recursion and without allocating: splits whose
+// left child is a split are rotated right until the left child is a leaf,
+// which is then freed together with the split; the walk continues down the
+// right spine. Every node is rotated at most once.
+void destroySubtree(std::unique_ptr<Node> cur) noexcept {
+  while (cur) {
+    if (cur->isLeaf()) return;  // unique_ptr frees it
+    auto* split = static_cast<LinearNode*>(cur.get());
     if (split->left && !split->left->isLeaf()) {
-      auto* top = static_cast<LinearNode*>(split->left.release());
-      split->left = std::move(top->right);
-      top->right.reset(cur);
-      cur = top;
+      std::unique_ptr<Node> top = std::move(split->left);
+      auto* l = static_cast<LinearNode*>(top.get());
+      split->left = std::move(l->right);
+      l->right = std::move(cur);
+      cur = std::move(top);
     } else {
-      if (split->left) destroyNode(static_cast<ConstantNode*>(split->left.release()), batch);
-      cur = split->right.release();
-      destroyNode(split, batch);
+      split->left.reset();
+      std::unique_ptr<Node> next = std::move(split->right);
+      cur = std::move(next);  // frees `split`, now childless
     }
-  }
-}
-
-// Usual depths: pre-order with a bounded stack of right subtrees, which frees
-// nodes in the order the reader made them and reads each node once; a part
-// deeper than the stack goes to destroyByRotation().
-void destroySubtree(std::unique_ptr<Node> subtree) noexcept {
-  constexpr size_t kStackDepth = 64;
-  ReleaseBatch batch;
-  Node* rights[kStackDepth];
-  size_t pending = 0;
-  Node* cur = subtree.release();
-  for (;;) {
-    while (cur != nullptr) {
-      if (cur->isLeaf()) {
-        destroyNode(static_cast<ConstantNode*>(cur), batch);
-        break;
-      }
-      if (pending == kStackDepth) {
-        destroyByRotation(cur, batch);
-        break;
-      }
-      auto* split = static_cast<LinearNode*>(cur);
-      cur = split->left.release();
-      rights[pending++] = split->right.release();
-      destroyNode(split, batch);
-    }
-    if (pending == 0) return;
-    cur = rights[--pending];
   }
 }
 
