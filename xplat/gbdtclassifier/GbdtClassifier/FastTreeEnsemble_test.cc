@@ -108,6 +108,7 @@ TEST(Compile, LayoutAndLeafValues) {
   const auto& single = e->getTrees()[1].nodes;
   ASSERT_EQ(single.size(), 1u);
   EXPECT_EQ(single[0].featureId, -1);
+  EXPECT_EQ(single[0].child, 0u);  // compiled where the first tree's root was
   EXPECT_EQ(single[0].value, 0.2f);
   EXPECT_EQ(e->requiredFeatures(), 4u);
   EXPECT_THROW(e->unnormalizedScore({0, 0, 0}), std::invalid_argument);  // too short
