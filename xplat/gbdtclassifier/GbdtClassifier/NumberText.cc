@@ -101,56 +101,6 @@ double readNonFiniteWord(std::string_view text, std::string_view& rest) {
   return negative ? -value : value;
 }
 
-// Writes a finite value at `q` in the layout described in NumberText.h and
-// returns the end of the text. The shortest
-// round-trip digits (the closest to the value among the shortest, ties to even)
-// come from the standard library's scientific form, "-d.ddde-XX", which is then
-// laid out: positional for decimal exponents -6 to 20, "<d.ddd>E<exponent>"
-// outside.
-char* writeShortestLayout(double value, char* q) {
-  char scientific[40];
-  const char* end = std::to_chars(scientific, scientific + sizeof scientific, value,
-                                  std::chars_format::scientific).ptr;
-  const char* p = scientific;
-  if (*p == '-') *q++ = *p++;
-  // At most 17 significant digits.
-  char digits[17];
-  int length = 0;
-  digits[length++] = *p++;
-  if (*p == '.') {
-    for (++p; *p != 'e'; ++p) digits[length++] = *p;
-  }
-  ++p;  // 'e'
-  const bool negativeExponent = *p == '-';
-  ++p;  // the exponent's sign is always written
-  int exponent = 0;
-  for (; p < end; ++p) exponent = exponent * 10 + (*p - '0');
-  if (negativeExponent) exponent = -exponent;
-
-  if (exponent < -6 || exponent >= 21) {
-    *q++ = digits[0];
-    if (length > 1) {
-      *q++ = '.';
-      q = std::copy(digits + 1, digits + length, q);
-    }
-    *q++ = 'E';
-    q = std::to_chars(q, q + 4, exponent).ptr;
-  } else if (exponent < 0) {
-    *q++ = '0';
-    *q++ = '.';
-    q = std::fill_n(q, -exponent - 1, '0');
-    q = std::copy(digits, digits + length, q);
-  } else if (exponent + 1 >= length) {
-    q = std::copy(digits, digits + length, q);
-    q = std::fill_n(q, exponent + 1 - length, '0');
-  } else {
-    q = std::copy(digits, digits + exponent + 1, q);
-    *q++ = '.';
-    q = std::copy(digits + exponent + 1, digits + length, q);
-  }
-  return q;
-}
-
 }  // namespace
 
 char* writeDoubleText(double value, char* out) {
@@ -165,14 +115,12 @@ char* writeDoubleText(double value, char* out) {
       return std::to_chars(out, limit, integer).ptr;
     }
   }
-  if (!std::isfinite(value)) {
-    // The builder ends its text with a NUL: it writes into its own buffer.
-    char text[kMaxDoubleTextSize + 1];
-    StringBuilder builder(text, sizeof text);
-    shortestWriter().ToShortest(value, &builder);
-    return std::copy(text, text + builder.position(), out);
-  }
-  return writeShortestLayout(value, out);
+  // The builder ends its text with a NUL, so it writes into a buffer of its
+  // own.
+  char text[kMaxDoubleTextSize + 1];
+  StringBuilder builder(text, sizeof text);
+  shortestWriter().ToShortest(value, &builder);
+  return std::copy(text, text + builder.position(), out);
 }
 
 void appendDoubleText(double value, std::string& out) {
