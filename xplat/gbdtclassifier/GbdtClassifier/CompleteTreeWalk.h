@@ -128,6 +128,7 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
                                    Takes takes) {
   CompleteForest out;
   bool any = false;
+  size_t splitTotal = 0, leafTotal = 0;
   // First each group's trees and depth, then the arrays at their final size
   // (padding splits read the NaN slot; absent trees have 0 leaves), then the
   // trees in their places.
@@ -156,20 +157,16 @@ CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafI
     uint32_t mask = 0;
     for (size_t k = 0; k < kCompleteGroup; ++k) mask |= static_cast<uint32_t>(taken[k]) << k;
     any = any || mask != 0;
-    const size_t splitStart = out.splitStart.empty()
-                                  ? 0
-                                  : out.splitStart.back() + kCompleteGroup * ((size_t{1} << out.depths.back()) - 1);
-    const size_t leafStart =
-        out.leafStart.empty() ? 0 : out.leafStart.back() + kCompleteGroup * (size_t{1} << out.depths.back());
     out.taken.push_back(mask);
     out.depths.push_back(depth);
-    out.splitStart.push_back(splitStart);
-    out.leafStart.push_back(leafStart);
+    out.splitStart.push_back(splitTotal);
+    out.leafStart.push_back(leafTotal);
+    splitTotal += kCompleteGroup * ((size_t{1} << depth) - 1);
+    leafTotal += kCompleteGroup * (size_t{1} << depth);
   }
   if (!any) return CompleteForest{};
-  const size_t lastDepth = out.depths.back();
-  out.splits.assign(out.splitStart.back() + kCompleteGroup * ((size_t{1} << lastDepth) - 1), CompleteSplit{nanSlot, 0});
-  out.leaves.assign(out.leafStart.back() + kCompleteGroup * (size_t{1} << lastDepth), 0.0f);
+  out.splits.assign(splitTotal, CompleteSplit{nanSlot, 0});
+  out.leaves.assign(leafTotal, 0.0f);
   for (size_t g = 0; g < out.depths.size(); ++g) {
     const size_t splitCount = (size_t{1} << out.depths[g]) - 1;
     const size_t leafCount = size_t{1} << out.depths[g];
