@@ -23,16 +23,20 @@ constexpr std::array<uint8_t, 256> makeDecodeTable() {
 constexpr std::array<uint8_t, 256> kDecodeTable = makeDecodeTable();
 
 // The same values placed where the k-th character of a group puts its six
-// bits among the group's three bytes, read as a little-endian word: the word
-// of a group is the OR of its four characters' entries.
+// bits among the group's three bytes, as a word whose bytes lie in memory in
+// that order on this host: the word of a group is the OR of its four
+// characters' entries.
+constexpr bool kLittleEndianHost = __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__;
 constexpr std::array<std::array<uint32_t, 256>, 4> makeWordTables() {
   std::array<std::array<uint32_t, 256>, 4> tables{};
-  for (size_t c = 0; c < 256; ++c) {
-    const uint32_t v = kDecodeTable[c];
-    tables[0][c] = v << 2;                          // byte 0, bits 7..2
-    tables[1][c] = (v >> 4) | ((v & 15) << 12);     // byte 0, bits 1..0; byte 1, bits 7..4
-    tables[2][c] = ((v >> 2) << 8) | ((v & 3) << 22);  // byte 1, bits 3..0; byte 2, bits 7..6
-    tables[3][c] = v << 16;                         // byte 2, bits 5..0
+  for (size_t k = 0; k < 4; ++k) {
+    for (size_t c = 0; c < 256; ++c) {
+      const uint32_t bits = uint32_t{kDecodeTable[c]} << (18 - 6 * k);  // in the group's 24 bits
+      for (size_t i = 0; i < 3; ++i) {
+        const uint32_t byte = (bits >> (16 - 8 * i)) & 0xFF;
+        tables[k][c] |= byte << (kLittleEndianHost ? 8 * i : 24 - 8 * i);
+      }
+    }
   }
   return tables;
 }
@@ -41,7 +45,6 @@ constexpr std::array<std::array<uint32_t, 256>, 4> kWordTables = makeWordTables(
 void decodeInto(std::string_view text, std::string& out) {
   const size_t groups = text.size() / 4;
   const auto* in = reinterpret_cast<const unsigned char*>(text.data());
-#if defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__
   // Each group is stored as a whole word; its fourth byte is overwritten by
   // the next group, or is the spare byte dropped at the end.
   out.resize(groups * 3 + 1);
@@ -52,19 +55,6 @@ void decodeInto(std::string_view text, std::string& out) {
     std::memcpy(o, &word, sizeof word);
   }
   out.resize(groups * 3);
-#else
-  out.resize(groups * 3);
-  auto* o = reinterpret_cast<unsigned char*>(out.data());
-  for (size_t g = 0; g < groups; ++g, in += 4, o += 3) {
-    const unsigned c0 = kDecodeTable[in[0]];
-    const unsigned c1 = kDecodeTable[in[1]];
-    const unsigned c2 = kDecodeTable[in[2]];
-    const unsigned c3 = kDecodeTable[in[3]];
-    o[0] = static_cast<unsigned char>((c0 << 2) | (c1 >> 4));
-    o[1] = static_cast<unsigned char>((c1 << 4) | (c2 >> 2));
-    o[2] = static_cast<unsigned char>((c2 << 6) | c3);
-  }
-#endif
   for (size_t i = groups * 4; i < text.size() && text[i] == kBase64Padding; ++i) {
     if (!out.empty()) out.pop_back();
   }
