@@ -10,7 +10,7 @@
 #include <string>
 
 #include "host/keystash/SqliteKeyValueStore.h"
-#include "host/keystash/TemporaryDirectory.h"
+#include "host/keystash/testing/TemporaryDirectory.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "bench/cpu_flags.h"

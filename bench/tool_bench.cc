@@ -24,7 +24,7 @@
 #include <vector>
 
 #include "bench/cpu_flags.h"
-#include "host/keystash/TemporaryDirectory.h"
+#include "host/keystash/testing/TemporaryDirectory.h"
 
 extern char** environ;
 

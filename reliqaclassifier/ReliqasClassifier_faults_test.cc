@@ -19,9 +19,9 @@
 #include <string>
 #include <vector>
 
-#include "host/keystash/FaultySqliteVfs.h"
+#include "host/keystash/testing/FaultySqliteVfs.h"
 #include "host/keystash/SqliteKeyValueStore.h"
-#include "host/keystash/TemporaryDirectory.h"
+#include "host/keystash/testing/TemporaryDirectory.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "reliqaclassifier/TestModels.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"

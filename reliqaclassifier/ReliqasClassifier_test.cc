@@ -15,11 +15,11 @@
 #include <tuple>
 #include <vector>
 
-#include "host/keystash/FaultInjectingKeyValueStore.h"
+#include "host/keystash/testing/FaultInjectingKeyValueStore.h"
 #include "host/keystash/InMemoryKeyValueStore.h"
 #include "host/keystash/SqliteKeyValueStore.h"
 #include "host/keystash/PersistentKeyValueStore.h"
-#include "host/keystash/TemporaryDirectory.h"
+#include "host/keystash/testing/TemporaryDirectory.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/TestModels.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"

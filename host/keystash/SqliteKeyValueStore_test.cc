@@ -10,7 +10,7 @@
 #include <thread>
 #include <vector>
 
-#include "host/keystash/TemporaryDirectory.h"
+#include "host/keystash/testing/TemporaryDirectory.h"
 
 namespace kestrova::mobile::xplat::keystash {
 namespace {

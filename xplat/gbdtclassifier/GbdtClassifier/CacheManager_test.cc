@@ -6,7 +6,7 @@
 #include <cmath>
 #include <limits>
 
-#include "host/keystash/FaultInjectingKeyValueStore.h"
+#include "host/keystash/testing/FaultInjectingKeyValueStore.h"
 #include "host/keystash/InMemoryKeyValueStore.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"

@@ -8,7 +8,7 @@ target_include_directories(reliqa_json PUBLIC ${PROJECT_SOURCE_DIR})
 target_link_libraries(reliqa_json PUBLIC double-conversion::double-conversion PRIVATE simdjson::simdjson)
 
 add_library(reliqa_cache STATIC ${CMAKE_CURRENT_LIST_DIR}/CacheManager.cc)
-target_link_libraries(reliqa_cache PUBLIC reliqa_json keystash PRIVATE glog::glog fmt::fmt)
+target_link_libraries(reliqa_cache PUBLIC reliqa_json keystash_interface PRIVATE glog::glog fmt::fmt)
 
 reliqa_test(reliqa_json_test
   SOURCES
@@ -18,4 +18,4 @@ reliqa_test(reliqa_json_test
 
 reliqa_test(reliqa_cache_test
   SOURCES ${CMAKE_CURRENT_LIST_DIR}/CacheManager_test.cc
-  LIBS reliqa_cache keystash glog::glog)
+  LIBS reliqa_cache keystash_testing glog::glog)

@@ -1,4 +1,4 @@
-#include "host/keystash/FaultySqliteVfs.h"
+#include "host/keystash/testing/FaultySqliteVfs.h"
 
 #include <cstring>
 #include <stdexcept>

@@ -1,4 +1,4 @@
-#include "host/keystash/FaultInjectingKeyValueStore.h"
+#include "host/keystash/testing/FaultInjectingKeyValueStore.h"
 
 #include <stdexcept>
 #include <utility>
