@@ -9,7 +9,6 @@
 
 #include <string>
 
-#include "host/jni/Api.h"
 #include "host/jni/References.h"
 
 namespace kestrova::jni {
@@ -18,7 +17,7 @@ template <typename ArrayT>
 class JPrimitiveArray;
 
 template <>
-class KESTROVA_JNI_API JPrimitiveArray<jbyteArray> {
+class JPrimitiveArray<jbyteArray> {
  public:
   explicit JPrimitiveArray(jbyteArray ref) noexcept : ref_(ref) {}
 
@@ -32,9 +31,9 @@ class KESTROVA_JNI_API JPrimitiveArray<jbyteArray> {
   jbyteArray ref_;
 };
 
-KESTROVA_JNI_API LocalRef<jbyteArray> make_byte_array(jsize size);
+LocalRef<jbyteArray> make_byte_array(jsize size);
 
 // A new byte[] holding exactly `bytes`.
-KESTROVA_JNI_API LocalRef<jbyteArray> make_byte_array(const std::string& bytes);
+LocalRef<jbyteArray> make_byte_array(const std::string& bytes);
 
 }  // namespace kestrova::jni

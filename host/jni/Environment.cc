@@ -1,11 +1,9 @@
+// The layer's process-wide state, kept in libkestrova_host.so.
 #include "host/jni/Environment.h"
 
 #include <atomic>
-#include <stdexcept>
 
 #include <glog/logging.h>
-
-#include "host/jni/Exceptions.h"
 
 namespace kestrova::jni {
 namespace {
@@ -32,16 +30,6 @@ JNIEnv* Environment::currentOrNull() noexcept {
   return static_cast<JNIEnv*>(env);
 }
 
-JNIEnv* Environment::current() {
-  if (JNIEnv* env = currentOrNull()) {
-    return env;
-  }
-  if (vm() == nullptr) {
-    throw std::runtime_error("the JNI support layer has not been initialised by JNI_OnLoad");
-  }
-  throw std::runtime_error("the calling thread is not attached to the Java VM");
-}
-
 JavaVM* Environment::vm() noexcept {
   return theVm.load(std::memory_order_acquire);
 }
@@ -54,30 +42,16 @@ ThreadScope::~ThreadScope() {
   scopedEnv = previous_;
 }
 
-}  // namespace kestrova::jni
+namespace detail {
 
-namespace kestrova::xplat {
-
-jint initialize(JavaVM* vm, void (*registerNatives)()) {
+bool attachVm(JavaVM* vm) noexcept {
   JavaVM* expected = nullptr;
-  if (!jni::theVm.compare_exchange_strong(expected, vm, std::memory_order_acq_rel) &&
-      expected != vm) {
+  if (!theVm.compare_exchange_strong(expected, vm, std::memory_order_acq_rel) && expected != vm) {
     LOG(ERROR) << "JNI support layer initialised with a second Java VM; keeping the first";
-    return JNI_ERR;
+    return false;
   }
-  void* env = nullptr;
-  if (vm->GetEnv(&env, JNI_VERSION_1_6) != JNI_OK) {
-    LOG(ERROR) << "JNI_OnLoad called on a thread without a JNI 1.6 environment";
-    return JNI_ERR;
-  }
-  jni::ThreadScope scope(static_cast<JNIEnv*>(env));
-  try {
-    registerNatives();
-  } catch (...) {
-    jni::translatePendingCppExceptionToJavaException();
-    return JNI_ERR;
-  }
-  return JNI_VERSION_1_6;
+  return true;
 }
 
-}  // namespace kestrova::xplat
+}  // namespace detail
+}  // namespace kestrova::jni

@@ -1,10 +1,7 @@
 #include "host/jni/Exceptions.h"
 
-#include <cstdarg>
-#include <cstdlib>
 #include <new>
 #include <stdexcept>
-#include <vector>
 
 #include <glog/logging.h>
 
@@ -167,23 +164,3 @@ void translatePendingCppExceptionToJavaException() noexcept {
 }
 
 }  // namespace kestrova::jni
-
-namespace kestrova {
-
-void assertInternal(const char* format, ...) {
-  va_list args;
-  va_start(args, format);
-  va_list copy;
-  va_copy(copy, args);
-  int length = std::vsnprintf(nullptr, 0, format, copy);
-  va_end(copy);
-  std::vector<char> message(length > 0 ? static_cast<size_t>(length) + 1 : 1, '\0');
-  if (length > 0) {
-    std::vsnprintf(message.data(), message.size(), format, args);
-  }
-  va_end(args);
-  LOG(FATAL) << message.data();
-  std::abort();  // not reached
-}
-
-}  // namespace kestrova

@@ -14,7 +14,10 @@
 //   anything else           com.kestrova.jni.CppException "unknown native exception"
 //
 // The message of a translated exception is what() of the C++ exception.
-// Everything here uses the calling thread's environment (Environment::current).
+// Everything here uses the calling thread's environment (Environment::current)
+// and is compiled into each library that uses it, so the exception handled by
+// translatePendingCppExceptionToJavaException() is one its own runtime threw
+// (see Api.h).
 #pragma once
 
 #include <jni.h>
@@ -24,11 +27,9 @@
 #include <memory>
 #include <string>
 
-#include "host/jni/Api.h"
-
 namespace kestrova::jni {
 
-class KESTROVA_JNI_API JniException : public std::exception {
+class JniException : public std::exception {
  public:
   // Keeps `throwable` (any kind of reference) through a new global reference.
   explicit JniException(jthrowable throwable);
@@ -48,14 +49,14 @@ class KESTROVA_JNI_API JniException : public std::exception {
 // Raises the pending Java exception, if any, as a JniException; otherwise,
 // when `failed`, a std::runtime_error. Call it right after a JNI call that may
 // raise, with that call's failure indication.
-KESTROVA_JNI_API void throwCppExceptionIf(bool failed);
+void throwCppExceptionIf(bool failed);
 
 // If a Java exception is pending, clears it and throws it as a JniException.
-KESTROVA_JNI_API void throwPendingJniExceptionAsCppException();
+void throwPendingJniExceptionAsCppException();
 
 // Throws a JniException carrying a new Java exception of class
 // `throwableName` (slash form) with `message` (UTF-8).
-[[noreturn]] KESTROVA_JNI_API void throwNewJavaException(const char* throwableName,
+[[noreturn]] void throwNewJavaException(const char* throwableName,
                                                          const char* message);
 
 // As above with a printf-style message; at least one argument is required.
@@ -73,14 +74,6 @@ template <typename Arg, typename... Args>
 // To be called inside a catch handler: makes the Java exception that matches
 // the exception being handled pending on the current thread (table above).
 // Never throws; if even that fails, the VM's own error stays pending.
-KESTROVA_JNI_API void translatePendingCppExceptionToJavaException() noexcept;
+void translatePendingCppExceptionToJavaException() noexcept;
 
 }  // namespace kestrova::jni
-
-namespace kestrova {
-
-// Writes the printf-style diagnostic through the fatal log and aborts.
-[[noreturn]] KESTROVA_JNI_API void assertInternal(const char* format, ...)
-    __attribute__((format(printf, 1, 2)));
-
-}  // namespace kestrova

@@ -13,7 +13,8 @@
 // get back to T without run-time type information.
 //
 // All functions use the calling thread's environment and raise Java failures
-// as JniException.
+// as JniException. BaseHybridClass is defined once, in libkestrova_host.so;
+// the HybridData helpers are compiled into each library (see Api.h).
 #pragma once
 
 #include <jni.h>
@@ -48,7 +49,7 @@ inline BaseHybridClass* peerFromNativePointer(jlong nativePointer) noexcept {
 }
 
 // Access to com.kestrova.jni.HybridData and its Destructor.
-class KESTROVA_JNI_API HybridData {
+class HybridData {
  public:
   // A new HybridData with its destructor object; no peer attached.
   static LocalRef<jobject> create();

@@ -12,17 +12,16 @@
 
 #include <jni.h>
 
-#include "host/jni/Api.h"
 #include "host/jni/References.h"
 
 namespace kestrova::jni {
 
 // A global reference that is never released.
-KESTROVA_JNI_API jclass findClassStatic(const char* name);
+jclass findClassStatic(const char* name);
 
-KESTROVA_JNI_API LocalRef<jclass> findClassLocal(const char* name);
+LocalRef<jclass> findClassLocal(const char* name);
 
-KESTROVA_JNI_API jfieldID getFieldId(jclass cls, const char* name, const char* signature);
-KESTROVA_JNI_API jmethodID getMethodId(jclass cls, const char* name, const char* signature);
+jfieldID getFieldId(jclass cls, const char* name, const char* signature);
+jmethodID getMethodId(jclass cls, const char* name, const char* signature);
 
 }  // namespace kestrova::jni

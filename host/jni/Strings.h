@@ -11,12 +11,11 @@
 #include <string>
 #include <string_view>
 
-#include "host/jni/Api.h"
 #include "host/jni/References.h"
 
 namespace kestrova::jni {
 
-class KESTROVA_JNI_API JString {
+class JString {
  public:
   explicit JString(jstring ref) noexcept : ref_(ref) {}
 

@@ -13,12 +13,11 @@
 #include <string>
 #include <string_view>
 
-#include "host/jni/Api.h"
 
 namespace kestrova::jni {
 
-KESTROVA_JNI_API std::string utf16ToUtf8(std::u16string_view text);
+std::string utf16ToUtf8(std::u16string_view text);
 
-KESTROVA_JNI_API std::u16string utf8ToUtf16(std::string_view text);
+std::u16string utf8ToUtf16(std::string_view text);
 
 }  // namespace kestrova::jni

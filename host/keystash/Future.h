@@ -9,6 +9,15 @@
 // in FutureError.h). A Promise destroyed without a result makes get() throw
 // FutureError 4 instead of blocking forever.
 //
+// Producer and consumer may live in different shared libraries, each with its
+// own copy of the C++ runtime (see host/jni/Api.h), where the producer's
+// exception could only be caught by catch (...). So get() rethrows the
+// producer's very exception only when both share a runtime; otherwise it
+// throws a copy made by the consumer's runtime: a FutureError with the same
+// code, a std::bad_alloc, or a std::runtime_error with the same what() for any
+// other std::exception. An exception that is no std::exception is rethrown as
+// it is.
+//
 // Both handles are movable, not copyable. One Future or Promise handle must not
 // be used by two threads at once; the producer and the consumer may run on
 // different threads.
@@ -19,9 +28,12 @@
 #include <functional>
 #include <memory>
 #include <mutex>
+#include <new>
 #include <optional>
 #include <stdexcept>
+#include <string>
 #include <type_traits>
+#include <typeinfo>
 #include <utility>
 #include <variant>
 
@@ -37,13 +49,63 @@ namespace detail {
 template <typename T>
 using StoredValue = std::conditional_t<std::is_void_v<T>, std::monostate, T>;
 
+// The copy of the C++ runtime that compiled the calling code. Each copy
+// defines the type information of std::exception once, so its address tells
+// copies apart, and code that shares a copy sees the same address.
+inline const void* runtimeIdentity() noexcept { return &typeid(std::exception); }
+
+// A producer's exception, as thrown and as another runtime can make it anew.
+struct Failure {
+  enum class Kind { kFutureError, kBadAlloc, kStdException, kOther };
+
+  std::exception_ptr error;  // null: no failure
+  const void* runtime = nullptr;
+  Kind kind = Kind::kOther;
+  int futureErrorCode = 0;
+  std::string what;
+
+  explicit operator bool() const noexcept { return error != nullptr; }
+
+  // Runs in the producer's runtime, which can still tell the types apart.
+  static Failure of(std::exception_ptr error) {
+    Failure failure;
+    if (!error) return failure;
+    failure.error = error;
+    failure.runtime = runtimeIdentity();
+    try {
+      std::rethrow_exception(error);
+    } catch (const FutureError& e) {
+      failure.kind = Kind::kFutureError;
+      failure.futureErrorCode = e.code();
+    } catch (const std::bad_alloc&) {
+      failure.kind = Kind::kBadAlloc;
+    } catch (const std::exception& e) {
+      failure.kind = Kind::kStdException;
+      failure.what = e.what();
+    } catch (...) {
+      failure.kind = Kind::kOther;
+    }
+    return failure;
+  }
+
+  // Runs in the consumer's runtime.
+  [[noreturn]] void rethrow() const {
+    if (runtime == runtimeIdentity() || kind == Kind::kOther) std::rethrow_exception(error);
+    switch (kind) {
+      case Kind::kFutureError: throw FutureError(futureErrorCode);
+      case Kind::kBadAlloc: throw std::bad_alloc();
+      default: throw std::runtime_error(what);
+    }
+  }
+};
+
 template <typename T>
 struct SharedState {
   std::mutex mutex;
   std::condition_variable ready;
   bool done = false;  // a value, an exception or abandonment is in
   std::optional<StoredValue<T>> value;
-  std::exception_ptr error;
+  Failure error;
   bool hasCallback = false;
   std::function<void(Future<T>)> callback;
 };
@@ -80,7 +142,7 @@ class Future {
     }
     state_.reset();  // single use
     // The result is complete and nobody writes it any more.
-    if (state->error) std::rethrow_exception(state->error);
+    if (state->error) state->error.rethrow();
     if (!state->value) throw FutureError(FutureError::kNoValueSource);
     if constexpr (std::is_void_v<T>) {
       return;
@@ -157,7 +219,8 @@ class Promise {
   }
 
   void setException(std::exception_ptr error) {
-    finish([&](detail::SharedState<T>& state) { state.error = std::move(error); });
+    detail::Failure failure = detail::Failure::of(std::move(error));
+    finish([&](detail::SharedState<T>& state) { state.error = std::move(failure); });
   }
 
  private:

@@ -94,5 +94,36 @@ TEST(FutureTest, CallbackGetsTheResultWhetherSetBeforeOrAfterIt) {
   EXPECT_EQ(seen, "ab4");
 }
 
+// A failure made by another copy of the C++ runtime (an exception of a
+// library other than the consumer's) comes out as the consumer's own
+// exception of the same kind and text; within one runtime it is the very
+// exception the producer set.
+TEST(FutureTest, FailuresFromAnotherRuntimeAreRebuiltByKindAndText) {
+  struct Custom : std::runtime_error {
+    Custom() : std::runtime_error("custom failure") {}
+  };
+  const int elsewhere = 0;
+  auto foreign = [&](std::exception_ptr error) {
+    detail::Failure failure = detail::Failure::of(std::move(error));
+    failure.runtime = &elsewhere;
+    return failure;
+  };
+
+  EXPECT_THROW(foreign(std::make_exception_ptr(Custom())).rethrow(), std::runtime_error);
+  try {
+    foreign(std::make_exception_ptr(Custom())).rethrow();
+  } catch (const Custom&) {
+    ADD_FAILURE() << "the producer's own type crossed runtimes";
+  } catch (const std::runtime_error& error) {
+    EXPECT_STREQ(error.what(), "custom failure");
+  }
+  EXPECT_EQ(errorCodeOf([&] { foreign(std::make_exception_ptr(FutureError(3))).rethrow(); }), 3);
+  EXPECT_THROW(foreign(std::make_exception_ptr(std::bad_alloc())).rethrow(), std::bad_alloc);
+  EXPECT_THROW(foreign(std::make_exception_ptr(42)).rethrow(), int);
+
+  Future<int> local = makeFailedFuture<int>(std::make_exception_ptr(Custom()));
+  EXPECT_THROW(local.get(), Custom);
+}
+
 }  // namespace
 }  // namespace kestrova::mobile::xplat::keystash

@@ -14,7 +14,9 @@
 //     returns normally, later fetches see the new entry.
 //   - Failures arrive as exceptions from the call or from the future's get();
 //     a store that fails leaves the entry as it was or replaced whole, never
-//     torn.
+//     torn. A store used from another shared library than its own (the host's
+//     store is) reports them only through the future, which carries them
+//     across C++ runtimes (Future.h); SqliteKeyValueStore does.
 //   - Any number of threads may call fetch and store at once.
 #pragma once
 

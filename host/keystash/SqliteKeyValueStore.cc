@@ -281,7 +281,7 @@ Future<std::optional<PersistentKeyValueStore::Entry>> SqliteKeyValueStore::fetch
   auto future = promise.getFuture();
   try {
     promise.setValue(database_->fetch(key));
-  } catch (const std::exception&) {
+  } catch (...) {
     promise.setException(std::current_exception());
   }
   return future;
@@ -294,7 +294,7 @@ Future<void> SqliteKeyValueStore::store(const std::string& key, const FileUtils:
   try {
     database_->store(key, value, extra);
     promise.setValue();
-  } catch (const std::exception&) {
+  } catch (...) {
     promise.setException(std::current_exception());
   }
   return future;

@@ -3,19 +3,26 @@
 // features) as canonical text, and classify through a fresh native classifier
 // without the managed wrappers, so that the tests can compare the binding's
 // answers with the native side's own. Doubles are written as the decimal value
-// of their 64-bit pattern, so every comparison is bit for bit.
+// of their 64-bit pattern, so every comparison is bit for bit. It also makes a
+// store that fails, in this library, so that its failures reach the classifier
+// library from another copy of the C++ runtime.
 #include <jni.h>
 
 #include <algorithm>
 #include <cstring>
+#include <iterator>
 #include <map>
 #include <memory>
 #include <string>
 
 #include "host/jni/Environment.h"
 #include "host/jni/Lookup.h"
+#include "host/jni/Exceptions.h"
+#include "host/jni/Hybrid.h"
 #include "host/jni/PersistentKeyValueStoreHybrid.h"
 #include "host/jni/Strings.h"
+#include "host/keystash/InMemoryKeyValueStore.h"
+#include "host/keystash/testing/FaultInjectingKeyValueStore.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "reliqaclassifier/jni/EntryPoint.h"
 #include "reliqaclassifier/jni/InputReader.h"
@@ -26,6 +33,8 @@
 namespace kestrova::reliqaclassifier {
 namespace {
 
+using mobile::xplat::keystash::FaultInjectingKeyValueStore;
+using mobile::xplat::keystash::InMemoryKeyValueStore;
 using mobile::xplat::keystash::PersistentKeyValueStoreHybrid;
 
 std::string bits(double value) {
@@ -111,6 +120,28 @@ jstring classifyDirectly(JNIEnv* env, jclass, jobject store, jobject input) {
   });
 }
 
+// static native PersistentKeyValueStore failingStore()
+// A managed store whose native store fails every fetch and store in the
+// future's get(). The managed object is made without its constructor, which
+// would open a database, and given the host's store peer over that store.
+jobject failingStore(JNIEnv* env, jclass) {
+  return entryPoint<jobject>(env, [env] {
+    auto failing = std::make_shared<FaultInjectingKeyValueStore>(std::make_shared<InMemoryKeyValueStore>());
+    failing->failFetches(FaultInjectingKeyValueStore::Failure::kInGet);
+    failing->failStores(FaultInjectingKeyValueStore::Failure::kInGet);
+    static const jclass storeClass = jni::findClassStatic(managed::kStore);
+    static const jfieldID hybridDataField = jni::getFieldId(storeClass, "mHybridData", managed::kHybridDataType);
+    jni::LocalRef<jobject> store(env->AllocObject(storeClass));
+    jni::throwCppExceptionIf(!store);
+    jni::LocalRef<jobject> hybridData = jni::detail::HybridData::create();
+    jni::LocalRef<jobject> destructor = jni::detail::HybridData::getDestructor(hybridData.get());
+    attachPeer(destructor.get(), std::make_unique<PersistentKeyValueStoreHybrid>(failing));
+    env->SetObjectField(store.get(), hybridDataField, hybridData.get());
+    jni::throwPendingJniExceptionAsCppException();
+    return store.release();
+  });
+}
+
 // A registration that fails: the class has no such native.
 void registerMissingNative() {
   static const JNINativeMethod methods[] = {
@@ -173,11 +204,13 @@ void registerNatives() {
        reinterpret_cast<void*>(&initializeWithFailingRegistration)},
       {const_cast<char*>("attachTwice"), const_cast<char*>("()V"),
        reinterpret_cast<void*>(&attachTwice)},
+      {const_cast<char*>("failingStore"), const_cast<char*>("()Lcom/kestrova/keystash/PersistentKeyValueStore;"),
+       reinterpret_cast<void*>(&failingStore)},
   };
   JNIEnv* env = jni::Environment::current();
   jni::LocalRef<jclass> cls =
       jni::findClassLocal("com/kestrova/sharefold/reliqaclassifier/models/NativeReference");
-  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 5) != JNI_OK);
+  jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, static_cast<jint>(std::size(methods))) != JNI_OK);
 }
 
 }  // namespace

@@ -35,4 +35,10 @@ final class NativeReference {
 
   /** Attaches a second peer to a holder that has one: the process aborts. */
   static native void attachTwice();
+
+  /**
+   * A store whose every fetch and store fails. Its native code lives in the test-support library,
+   * so its failures reach the classifier library from another copy of the C++ runtime.
+   */
+  static native PersistentKeyValueStore failingStore();
 }

@@ -55,4 +55,20 @@ class PersistenceTest {
       assertTrue(result.isOverThreshold());
     }
   }
+
+  /** A store that fails is logged and read as empty, from whichever library its failures come. */
+  @Test
+  void storeFailuresNeverReachTheCaller() {
+    try (PersistentKeyValueStore store = NativeReference.failingStore();
+        ReliqaClassifier classifier = new ReliqaClassifier(store)) {
+      classifier.setModelParams(new ReliqaClassifierModelParams(ClassifierTest.MODEL, "lost", 0.6));
+      classifier.setServerFeatures(new ReliqaClassifierServerFeatures(Map.of("4", "9")));
+      assertEquals("", classifier.currentlyUsedModelId());
+      try (ReliqaClassifierResult result = classifier.classify(collection(3))) {
+        assertEquals(1.0, result.getScore());  // no model could be read back
+        assertEquals("", result.getLoggingValue("model_id"));
+        assertEquals("0", result.getLoggingValue("threshold"));
+      }
+    }
+  }
 }
