@@ -1,30 +1,38 @@
 #!/usr/bin/env bash
-# Cross-builds the whole tree for a phone ABI into build-<ABI>/, with the same
-# layout as build/ (bin/, lib/): the libraries, the JNI library, the host
-# libraries, the reliqa tool and the tests.
-#   scripts/build-abi.sh arm64|armhf [extra cmake arguments]
-# build-<ABI>/emulator runs a program of that ABI under qemu-user, e.g.
+# Builds the whole tree as an app ships it, for one ABI, into build-<ABI>/:
+# clang, LLVM's libc++ linked statically, and the dependencies of
+# scripts/build-deps.sh linked in (cmake/toolchains/<ABI>.cmake). The layout
+# is that of build/ (bin/, lib/, java/): the JNI libraries, the reliqa tool
+# and every test.
+#   scripts/build-abi.sh x86_64|arm64|armhf [extra cmake arguments]
+# x86_64 runs here; arm64 and armhf are cross-built against a Debian sysroot
+# and build-<ABI>/emulator runs their programs under qemu-user, e.g.
 #   build-arm64/emulator build-arm64/bin/reliqa --help
-# and ctest --test-dir build-<ABI> runs the tests through it.
+# ctest --test-dir build-<ABI> runs the tests (through the emulator).
 set -euo pipefail
 cd "$(dirname "$0")/.."
-ABI=${1:?usage: $0 arm64|armhf [cmake arguments]}
+ABI=${1:?usage: $0 x86_64|arm64|armhf [cmake arguments]}
 shift
 case "$ABI" in
-  arm64 | armhf) ;;
-  *) echo "build-abi: unknown ABI '$ABI' (arm64 or armhf)" >&2; exit 2 ;;
+  x86_64 | arm64 | armhf) ;;
+  *) echo "build-abi: unknown ABI '$ABI' (x86_64, arm64 or armhf)" >&2; exit 2 ;;
 esac
 
 bash scripts/setup.sh
-SYSROOT=$(bash scripts/sysroot.sh "$ABI")
+DEPS=$(bash scripts/build-deps.sh "$ABI")
+SYSROOT=""
+[ "$ABI" = x86_64 ] || SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 BUILD=build-$ABI
-# A build configured against another sysroot keeps that sysroot's compiler
-# facts: start it afresh.
-if [ -f "$BUILD/CMakeCache.txt" ] && ! grep -qxF "RELIQA_SYSROOT:PATH=$SYSROOT" "$BUILD/CMakeCache.txt"; then
+# A build configured against another sysroot or other dependencies keeps
+# their compiler facts and paths: start it afresh.
+if [ -f "$BUILD/CMakeCache.txt" ] &&
+   ! { grep -qxF "RELIQA_SYSROOT:PATH=$SYSROOT" "$BUILD/CMakeCache.txt" &&
+       grep -qxF "RELIQA_DEPS:PATH=$DEPS" "$BUILD/CMakeCache.txt"; }; then
   rm -rf "$BUILD/CMakeCache.txt" "$BUILD/CMakeFiles"
 fi
 cmake -S . -B "$BUILD" -G Ninja -Wno-dev \
   -DCMAKE_TOOLCHAIN_FILE="$PWD/cmake/toolchains/$ABI.cmake" \
-  -DRELIQA_SYSROOT:PATH="$SYSROOT" -DRELIQA_BENCH=OFF -DCMAKE_BUILD_TYPE=RelWithDebInfo "$@" >/dev/null
+  -DRELIQA_SYSROOT:PATH="$SYSROOT" -DRELIQA_DEPS:PATH="$DEPS" \
+  -DCMAKE_BUILD_TYPE=RelWithDebInfo "$@" >/dev/null
 cmake --build "$BUILD" -j "${JOBS:-$(nproc)}"
-echo "build-abi: $BUILD is ready; run its programs with $BUILD/emulator" >&2
+echo "build-abi: $BUILD is ready${SYSROOT:+; run its programs with $BUILD/emulator}" >&2

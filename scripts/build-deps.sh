@@ -1,24 +1,24 @@
 #!/usr/bin/env bash
-# Rebuilds the shared libraries the app ships besides its own: glog, gflags,
-# fmt, double-conversion, simdjson and SQLite, from Debian's source packages
-# of exactly the versions whose headers the project compiles against, and
-# prints the install prefix (lib/ and include/) on standard output.
+# Builds the libraries that the shipped libraries link in: glog, gflags, fmt,
+# double-conversion, simdjson and SQLite, and GoogleTest for the tests that
+# run on each ABI, from Debian's source packages of exactly the versions whose
+# headers the project compiles against, and prints the install prefix (lib/
+# and include/, with each package's CMake files) on standard output.
 #   scripts/build-deps.sh x86_64|arm64|armhf
-# Debian's binaries of these libraries cannot go into the app: on amd64 their
-# LOAD segments are aligned for 4 KB pages only, and several are linked
-# without BIND_NOW. The copies made here keep Debian's SONAMEs and configure
-# options, so they are drop-in replacements for the libraries the project was
-# linked against, and are compiled and linked like our own libraries (16 KB
-# pages, full RELRO, build IDs, section GC). The C library and the C++ runtime
-# are not rebuilt: on a phone they come with the platform and the NDK.
+# They are static archives of position-independent code, compiled like the
+# shipped libraries themselves by the ABI's toolchain file
+# (cmake/toolchains/<ABI>.cmake): clang, LLVM's libc++, hidden visibility and
+# one section per function, so that a library linking them in exports none of
+# their symbols and drops what it does not use. Debian's own builds cannot be
+# used: they are shared libraries on GNU's C++ runtime.
 #
 # Sources are fetched with `apt-get source` through a private APT
 # configuration (the machine's own Debian mirrors, as deb-src), so the
 # system's APT state is left alone. Sources and builds are cached under
 # ${XDG_CACHE_HOME:-~/.cache}/reliqa/, keyed by the ABI, the versions, the
-# flags and this script, so a second run only prints the prefix.
-# Build logs go to <prefix>.build/<library>.log while building; JOBS sets the
-# build parallelism (default: the number of cores).
+# flags, the toolchain files and this script, so a second run only prints the
+# prefix. Build logs go to <prefix>.build/<library>.log while building; JOBS
+# sets the build parallelism (default: the number of cores).
 set -euo pipefail
 cd "$(dirname "$0")/.."
 ABI=${1:?usage: $0 x86_64|arm64|armhf}
@@ -31,18 +31,20 @@ ROOT=$PWD
 JOBS=${JOBS:-$(nproc)}
 
 # Source package, the -dev package whose headers we compile against (its
-# version is the one rebuilt), and the SONAME the rebuilt library must keep.
+# version is the one rebuilt), and the archives the build must leave in lib/.
 DEPS=(
-  "gflags            libgflags-dev            libgflags.so.2.2"
-  "google-glog       libgoogle-glog-dev       libglog.so.1"
-  "fmtlib            libfmt-dev               libfmt.so.9"
-  "double-conversion libdouble-conversion-dev libdouble-conversion.so.3"
-  "simdjson          libsimdjson-dev          libsimdjson.so.14"
-  "sqlite3           libsqlite3-dev           libsqlite3.so.0"
+  "gflags            libgflags-dev            libgflags.a"
+  "google-glog       libgoogle-glog-dev       libglog.a"
+  "fmtlib            libfmt-dev               libfmt.a"
+  "double-conversion libdouble-conversion-dev libdouble-conversion.a"
+  "simdjson          libsimdjson-dev          libsimdjson.a"
+  "sqlite3           libsqlite3-dev           libsqlite3.a"
+  "googletest        libgtest-dev             libgtest.a libgtest_main.a libgmock.a"
 )
 
-CFLAGS_COMMON="-O2 -ffp-contract=off -ffunction-sections -fdata-sections -fstack-protector-strong -D_FORTIFY_SOURCE=2 -fPIC"
-LDFLAGS_COMMON="-Wl,-z,max-page-size=16384 -Wl,-z,relro,-z,now -Wl,--build-id -Wl,--gc-sections -Wl,--no-undefined -Wl,--as-needed"
+# Optimisation and hardening as the project's optimised builds have them; the
+# toolchain file adds the rest (runtime, visibility, sections, no contraction).
+CFLAGS_COMMON="-O2 -fPIC -fstack-protector-strong -D_FORTIFY_SOURCE=2"
 
 versions=()
 for entry in "${DEPS[@]}"; do
@@ -62,8 +64,10 @@ SYSROOT=""
 if [ "$ABI" != x86_64 ]; then
   SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 fi
-key=$( { echo "$ABI $SYSROOT"; printf '%s\n' "${versions[@]}"; echo "$CFLAGS_COMMON $LDFLAGS_COMMON";
-         cat scripts/build-deps.sh scripts/cache-common.sh; [ "$ABI" = x86_64 ] || cat "cmake/toolchains/$ABI.cmake" cmake/toolchains/cross-common.cmake; } |
+TOOLCHAIN=$ROOT/cmake/toolchains/$ABI.cmake
+key=$( { echo "$ABI $SYSROOT"; printf '%s\n' "${versions[@]}"; echo "$CFLAGS_COMMON";
+         cat scripts/build-deps.sh scripts/cache-common.sh "$TOOLCHAIN" cmake/toolchains/libcxx-static.cmake;
+         [ "$ABI" = x86_64 ] || cat cmake/toolchains/cross-common.cmake; } |
        sha256sum | cut -c1-12)
 PREFIX=$CACHE/deps-$ABI-$key
 if [ -f "$PREFIX/.complete" ]; then
@@ -117,21 +121,21 @@ done
 BUILD=$PREFIX.build
 rm -rf "$PREFIX" "$PREFIX.tmp" "$BUILD"
 mkdir -p "$PREFIX.tmp" "$BUILD"
-# CMake starts CMAKE_<LANG>_FLAGS and the linker flags from these, and adds
-# the toolchain file's target flags to them.
-export CFLAGS="$CFLAGS_COMMON" CXXFLAGS="$CFLAGS_COMMON" LDFLAGS="$LDFLAGS_COMMON"
+# CMake starts CMAKE_<LANG>_FLAGS from these and adds the toolchain's flags.
+export CFLAGS="$CFLAGS_COMMON" CXXFLAGS="$CFLAGS_COMMON"
 CMAKE_COMMON=(
   -G Ninja -Wno-dev
+  -DCMAKE_TOOLCHAIN_FILE="$TOOLCHAIN"
   -DCMAKE_BUILD_TYPE=Release
   # Release without its -O3: the -O2 above applies. NDEBUG as Debian has it
   # (some of these headers change class layouts without it).
   -DCMAKE_C_FLAGS_RELEASE=-DNDEBUG -DCMAKE_CXX_FLAGS_RELEASE=-DNDEBUG
   -DCMAKE_INSTALL_PREFIX="$PREFIX.tmp" -DCMAKE_INSTALL_LIBDIR=lib
+  -DRELIQA_DEPS="$PREFIX.tmp"
+  -DBUILD_SHARED_LIBS=OFF -DCMAKE_POSITION_INDEPENDENT_CODE=ON
   -DBUILD_TESTING=OFF
 )
-if [ "$ABI" != x86_64 ]; then
-  CMAKE_COMMON+=(-DCMAKE_TOOLCHAIN_FILE="$ROOT/cmake/toolchains/$ABI.cmake" -DRELIQA_SYSROOT:PATH="$SYSROOT")
-fi
+[ "$ABI" = x86_64 ] || CMAKE_COMMON+=(-DRELIQA_SYSROOT:PATH="$SYSROOT")
 
 cmake_build() {  # cmake_build <name> <source dir> [cmake arguments]: configure, build, install
   local name=$1 src=$2 log=$BUILD/$1.log
@@ -146,23 +150,26 @@ cmake_build() {  # cmake_build <name> <source dir> [cmake arguments]: configure,
   fi
 }
 
-# The options are those of each package's debian/rules, less tests and docs.
+# The options are those of each package's debian/rules, less tests and docs,
+# and static.
 src=$(unpack_source gflags "$(version_of gflags)")
-cmake_build gflags "$src" -DBUILD_SHARED_LIBS=ON -DBUILD_STATIC_LIBS=OFF -DLIB_INSTALL_DIR=lib
+cmake_build gflags "$src" -DBUILD_STATIC_LIBS=ON -DLIB_INSTALL_DIR=lib
 
 src=$(unpack_source google-glog "$(version_of google-glog)")
-cmake_build glog "$src" -DBUILD_SHARED_LIBS=ON -DWITH_GFLAGS=ON -DWITH_UNWIND=OFF -DWITH_GTEST=OFF \
+cmake_build glog "$src" -DWITH_GFLAGS=ON -DWITH_UNWIND=OFF -DWITH_GTEST=OFF \
   -Dgflags_DIR="$PREFIX.tmp/lib/cmake/gflags"
 
 src=$(unpack_source fmtlib "$(version_of fmtlib)")
-cmake_build fmt "$src" -DBUILD_SHARED_LIBS=ON -DCMAKE_POSITION_INDEPENDENT_CODE=ON \
-  -DFMT_DOC=OFF -DFMT_TEST=OFF -DFMT_PEDANTIC=ON
+cmake_build fmt "$src" -DFMT_DOC=OFF -DFMT_TEST=OFF -DFMT_PEDANTIC=ON
 
 src=$(unpack_source double-conversion "$(version_of double-conversion)")
-cmake_build double-conversion "$src" -DBUILD_SHARED_LIBS=ON
+cmake_build double-conversion "$src"
 
 src=$(unpack_source simdjson "$(version_of simdjson)")
-cmake_build simdjson "$src" -DBUILD_SHARED_LIBS=ON -DSIMDJSON_DEVELOPER_MODE=OFF
+cmake_build simdjson "$src" -DSIMDJSON_DEVELOPER_MODE=OFF
+
+src=$(unpack_source googletest "$(version_of googletest)")
+cmake_build googletest "$src" -DBUILD_GMOCK=ON -DINSTALL_GTEST=ON
 
 # SQLite: Debian's source is the full tree. Its amalgamation (sqlite3.c) is
 # generated once on this machine, from the patched tree, and compiled per
@@ -188,8 +195,7 @@ mkdir -p "$BUILD/sqlite3-src"
 cat >"$BUILD/sqlite3-src/CMakeLists.txt" <<EOF
 cmake_minimum_required(VERSION 3.16)
 project(sqlite3 C)
-add_library(sqlite3 SHARED "$amalg/sqlite3.c")
-set_target_properties(sqlite3 PROPERTIES VERSION 0.8.6 SOVERSION 0)
+add_library(sqlite3 STATIC "$amalg/sqlite3.c")
 target_compile_options(sqlite3 PRIVATE -fno-strict-aliasing)
 target_compile_definitions(sqlite3 PRIVATE
   # debian/rules CFLAGS
@@ -217,19 +223,28 @@ target_compile_definitions(sqlite3 PRIVATE
   _REENTRANT=1 HAVE_USLEEP=1 HAVE_FDATASYNC=1 HAVE_LOCALTIME_R=1 HAVE_GMTIME_R=1
   HAVE_ISNAN=1 HAVE_STRCHRNUL=1 HAVE_POSIX_FALLOCATE=1 HAVE_UTIME=1
   HAVE_DECL_STRERROR_R=1 HAVE_STRERROR_R=1 HAVE_STDINT_H=1 HAVE_INTTYPES_H=1)
-target_link_libraries(sqlite3 PRIVATE m \${CMAKE_DL_LIBS} pthread)
-install(TARGETS sqlite3 LIBRARY DESTINATION lib)
+install(TARGETS sqlite3 ARCHIVE DESTINATION lib)
 install(FILES "$amalg/sqlite3.h" "$amalg/sqlite3ext.h" DESTINATION include)
 EOF
 cmake_build sqlite3 "$BUILD/sqlite3-src"
 
-# Every library must carry Debian's SONAME.
+# Every archive must be there, and the C++ ones must be built on libc++
+# (whose names live in std::__1) and not on GNU's runtime (std::__cxx11): an
+# archive built on another runtime could link, and fail when it runs.
+NM=$(command -v llvm-nm-14 || command -v llvm-nm)
 for entry in "${DEPS[@]}"; do
-  read -r _ _ soname <<<"$entry"
-  lib=$PREFIX.tmp/lib/$soname
-  [ -e "$lib" ] || { echo "build-deps: $ABI: $soname was not built" >&2; exit 1; }
-  got=$(readelf -d "$lib" | sed -n 's/.*(SONAME).*\[\(.*\)\]/\1/p')
-  [ "$got" = "$soname" ] || { echo "build-deps: $ABI: $lib has SONAME '$got', expected $soname" >&2; exit 1; }
+  read -r src _ archives <<<"$entry"
+  paths=()
+  for archive in $archives; do
+    paths+=("$PREFIX.tmp/lib/$archive")
+    [ -f "$PREFIX.tmp/lib/$archive" ] || { echo "build-deps: $ABI: $archive was not built" >&2; exit 1; }
+  done
+  [ "$src" = sqlite3 ] && continue
+  names=$("$NM" -C "${paths[@]}" 2>/dev/null)
+  if ! grep -q 'std::__1::' <<<"$names" || grep -q 'std::__cxx11::' <<<"$names"; then
+    echo "build-deps: $ABI: $archives: not built on libc++" >&2
+    exit 1
+  fi
 done
 
 rm -rf "$BUILD"

@@ -1,10 +1,14 @@
 #!/usr/bin/env bash
 # Makes (once) a Debian sysroot for a target ABI and prints its path.
 #   scripts/sysroot.sh arm64|armhf
-# The sysroot holds the target's C library, C++ runtime, time zones and the
-# -dev packages the project builds against, unpacked by mmdebstrap from the
-# machine's own Debian sources (nothing is installed on this machine for
-# another architecture). It is cached under ~/.cache/reliqa/ and made anew
+# The sysroot holds what a phone's platform and NDK stand for: the target's C
+# library, LLVM's C++ runtime (libc++, libc++abi and libunwind, linked
+# statically), libgcc's builtins and the time zones; the header-only CLI11 the
+# tool builds against; and a Java runtime of the target, which runs the JVM
+# suite under the emulator. Every other library the project uses is built from
+# source for the target by scripts/build-deps.sh. The packages are unpacked by
+# mmdebstrap from the machine's own Debian sources (nothing is installed on
+# this machine for another architecture). It is cached under ~/.cache/reliqa/ and made anew
 # when the package list or the sources change.
 set -euo pipefail
 ABI=${1:?usage: $0 arm64|armhf}
@@ -14,9 +18,9 @@ case "$ABI" in
 esac
 
 PACKAGES=(
-  libc6-dev libstdc++-12-dev libgcc-12-dev tzdata
-  libgoogle-glog-dev libgflags-dev libdouble-conversion-dev libfmt-dev libsimdjson-dev libsqlite3-dev
-  libgtest-dev libgmock-dev libcli11-dev
+  libc6-dev libgcc-12-dev libc++-14-dev libc++abi-14-dev libunwind-14-dev tzdata
+  libcli11-dev
+  openjdk-17-jre-headless
 )
 
 cd "$(dirname "$0")/.."
@@ -72,6 +76,6 @@ find "$ROOT.tmp" -type l -lname '/*' | while read -r link; do
   ln -sfn "$ROOT/${target#/}" "$link"
 done
 # and some CMake package files name their headers by absolute path.
-grep -rlZ 'INTERFACE_INCLUDE_DIRECTORIES "/usr/' "$ROOT.tmp/usr/lib" "$ROOT.tmp/usr/share" --include='*.cmake' |
+{ grep -rlZ 'INTERFACE_INCLUDE_DIRECTORIES "/usr/' "$ROOT.tmp/usr/lib" "$ROOT.tmp/usr/share" --include='*.cmake' || true; } |
   xargs -0 -r sed -i "s|INTERFACE_INCLUDE_DIRECTORIES \"/usr/|INTERFACE_INCLUDE_DIRECTORIES \"$ROOT/usr/|"
 publish_cached "$ROOT"

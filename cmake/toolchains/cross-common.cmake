@@ -1,9 +1,11 @@
-# Shared part of the cross toolchains: Debian's clang and lld for the target
-# triple, against a Debian sysroot of that architecture (scripts/sysroot.sh
-# makes one; scripts/build-abi.sh passes it as RELIQA_SYSROOT), and Debian's
-# qemu-user-static to run what the build makes.
+# Shared part of the toolchains of the phone ABIs (arm64.cmake, armhf.cmake):
+# the shipped configuration (libcxx-static.cmake) cross-built for the target
+# triple against a Debian sysroot of that architecture (scripts/sysroot.sh
+# makes one; scripts/build-abi.sh passes it as RELIQA_SYSROOT), with the
+# sysroot's LLVM C++ runtime, and Debian's qemu-user-static to run what the
+# build makes.
 #
-# The including file sets RELIQA_TRIPLE, RELIQA_QEMU and, optionally,
+# The including file sets RELIQA_TRIPLE, RELIQA_QEMU_NAME and, optionally,
 # RELIQA_TARGET_FLAGS before including this one.
 
 set(CMAKE_SYSTEM_NAME Linux)
@@ -14,21 +16,16 @@ endif()
 if(NOT RELIQA_SYSROOT OR NOT EXISTS "${RELIQA_SYSROOT}/usr/include")
   message(FATAL_ERROR "Set RELIQA_SYSROOT to a ${RELIQA_TRIPLE} sysroot (scripts/sysroot.sh makes one).")
 endif()
-# try_compile projects read this file again and need the same sysroot.
-list(APPEND CMAKE_TRY_COMPILE_PLATFORM_VARIABLES RELIQA_SYSROOT)
 
 set(CMAKE_SYSROOT "${RELIQA_SYSROOT}")
-set(CMAKE_C_COMPILER clang)
-set(CMAKE_CXX_COMPILER clang++)
 set(CMAKE_C_COMPILER_TARGET ${RELIQA_TRIPLE})
 set(CMAKE_CXX_COMPILER_TARGET ${RELIQA_TRIPLE})
-set(CMAKE_C_FLAGS_INIT "${RELIQA_TARGET_FLAGS}")
-set(CMAKE_CXX_FLAGS_INIT "${RELIQA_TARGET_FLAGS}")
-foreach(kind EXE SHARED MODULE)
-  set(CMAKE_${kind}_LINKER_FLAGS_INIT "-fuse-ld=lld")
-endforeach()
+set(RELIQA_LLVM_ROOT "${RELIQA_SYSROOT}/usr/lib/llvm-14")
+include(${CMAKE_CURRENT_LIST_DIR}/libcxx-static.cmake)
 
-set(CMAKE_FIND_ROOT_PATH "${RELIQA_SYSROOT}")
+# Libraries, headers and packages come from the dependencies' prefix, then
+# from the sysroot; programs from the build machine.
+set(CMAKE_FIND_ROOT_PATH ${RELIQA_DEPS} "${RELIQA_SYSROOT}")
 set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
 set(CMAKE_FIND_ROOT_PATH_MODE_LIBRARY ONLY)
 set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
