@@ -1,35 +1,57 @@
 #!/usr/bin/env bash
 # The JVM tests of the JNI libraries: runs the JUnit 5 suite of
-# <build>/java/reliqa-tests.jar in a JVM with -Xcheck:jni, fails on any JNI
-# warning the JVM prints, and checks that libreliqaclassifier.so exports only
-# its JNI entry points. Usage: scripts/test-java.sh <build directory>
+# BUILD/java/reliqa-tests.jar in a JVM with -Xcheck:jni and fails on any JNI
+# warning the JVM prints.
+#   scripts/test-java.sh BUILD [LIBDIR]
+# BUILD is a build directory (build/, or build-<ABI>/ of scripts/build-abi.sh);
+# its lib/ gives the tests' own native library. LIBDIR holds the
+# libreliqaclassifier.so and libkestrova_host.so under test (default:
+# BUILD/lib; dist/<ABI> tests what ships). A cross build's tests run in the
+# Java runtime of its sysroot, under the emulator.
 set -euo pipefail
 cd "$(dirname "$0")/.."
-BUILD=${1:?usage: $0 <build directory>}
-LIB=$BUILD/lib
+BUILD=${1:?usage: $0 BUILD [LIBDIR]}
+LIBDIR=${2:-$BUILD/lib}
 JAR=$BUILD/java/reliqa.jar
 TESTS=$BUILD/java/reliqa-tests.jar
+SUPPORT=$BUILD/lib/libreliqa_jni_testsupport.so
 JUNIT=/usr/share/java/junit-platform-console-standalone.jar
 
-for f in "$LIB/libreliqaclassifier.so" "$LIB/libkestrova_host.so" \
-         "$LIB/libreliqa_jni_testsupport.so" "$JAR" "$TESTS" "$JUNIT"; do
-  [ -e "$f" ] || { echo "test-java: missing $f (build the plain tree first)" >&2; exit 1; }
+for f in "$LIBDIR/libreliqaclassifier.so" "$LIBDIR/libkestrova_host.so" "$SUPPORT" "$JAR" "$TESTS" "$JUNIT"; do
+  [ -e "$f" ] || { echo "test-java: missing $f (build $BUILD first)" >&2; exit 1; }
 done
 
-echo "-- exported symbols of libreliqaclassifier.so"
-exported=$(nm -D --defined-only "$LIB/libreliqaclassifier.so" | awk '{print $3}' | sort | tr '\n' ' ')
-if [ "$exported" != "JNI_OnLoad JNI_OnLoad_Weak " ]; then
-  echo "test-java: libreliqaclassifier.so must export exactly JNI_OnLoad and JNI_OnLoad_Weak," \
-       "but exports: $exported" >&2
-  exit 1
-fi
-echo "JNI_OnLoad JNI_OnLoad_Weak"
+work=$(mktemp -d)
+trap 'rm -rf "$work"' EXIT
+# The tests' own library, alone in a directory, so that every other library
+# comes from LIBDIR.
+mkdir "$work/support"
+cp "$SUPPORT" "$work/support/"
+libpath=$(realpath "$LIBDIR"):$work/support
 
-echo "-- JUnit suite (-Xcheck:jni)"
-log=$(mktemp)
-trap 'rm -f "$log"' EXIT
+java=(java)
+if [ -x "$BUILD/emulator" ]; then
+  sysroot=$(sed -n 's/^RELIQA_SYSROOT:PATH=//p' "$BUILD/CMakeCache.txt")
+  jvm=$(ls "$sysroot"/usr/lib/jvm/java-17-openjdk-*/bin/java 2>/dev/null | head -n 1)
+  [ -n "$jvm" ] || { echo "test-java: no Java runtime in the sysroot $sysroot (scripts/sysroot.sh)" >&2; exit 1; }
+  # The emulator runs one program, and this machine does not run programs of
+  # the ABI by itself: the tests start child JVMs through the emulator, and
+  # the JVM starts them by fork and exec, not through its spawn helper (a
+  # program of the ABI).
+  # The tests' temporary files go to a tmpfs: the host's ext4 hands the
+  # emulated process (a 64-bit process to the host's kernel) 64-bit directory
+  # offsets, which a 32-bit Java runtime cannot read (EOVERFLOW); tmpfs's fit.
+  [ -d /dev/shm ] && [ -w /dev/shm ] || { echo "test-java: needs a writable tmpfs at /dev/shm" >&2; exit 1; }
+  tmp=$(mktemp -d -p /dev/shm reliqa-java.XXXXXX)
+  trap 'rm -rf "$work" "$tmp"' EXIT
+  java=("$(realpath "$BUILD/emulator")" "$jvm" "-Dreliqa.emulator=$(realpath "$BUILD/emulator")"
+        -Djdk.lang.Process.launchMechanism=FORK "-Djava.io.tmpdir=$tmp")
+fi
+
+echo "-- JUnit suite (-Xcheck:jni): $LIBDIR"
+log=$work/log
 status=0
-java -Xcheck:jni -Djava.library.path="$LIB" \
+LD_LIBRARY_PATH=$libpath "${java[@]}" -Xcheck:jni -Djava.library.path="$libpath" \
   -cp "$JUNIT:$JAR:$TESTS" org.junit.platform.console.ConsoleLauncher \
   --disable-banner --disable-ansi-colors --details=tree --fail-if-no-tests \
   --scan-classpath "$TESTS" 2>&1 | tee "$log" || status=$?

@@ -10,6 +10,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <ctime>
 #include <iterator>
 #include <map>
 #include <memory>
@@ -84,6 +85,9 @@ std::string describe(const ReliqaClassifierInput& input) {
 jstring toJava(const std::string& text) {
   return jni::JString::fromStdString(text).release();
 }
+
+// static native int timeBits()
+jint timeBits(JNIEnv*, jclass) { return static_cast<jint>(sizeof(time_t) * 8); }
 
 // static native String describeInput(ReliqaClassifierInput input)
 jstring describeInput(JNIEnv* env, jclass, jobject input) {
@@ -184,6 +188,7 @@ void attachTwice(JNIEnv* env, jclass) {
 
 void registerNatives() {
   static const JNINativeMethod methods[] = {
+      {const_cast<char*>("timeBits"), const_cast<char*>("()I"), reinterpret_cast<void*>(&timeBits)},
       {const_cast<char*>("describeInput"),
        const_cast<char*>(
            "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;)"

@@ -13,6 +13,27 @@ import java.util.TreeMap;
 final class Fixtures {
   private Fixtures() {}
 
+  /**
+   * Starts a JVM like this one (same libraries, classes and JNI checks) running {@code mainClass},
+   * with its output and errors merged. Under an emulator, which runs one program and not the
+   * programs it starts, the system property {@code reliqa.emulator} names the command that runs a
+   * program of this ABI, and the child is started through it.
+   */
+  static Process startJvm(Class<?> mainClass, String... args) throws java.io.IOException {
+    List<String> command = new ArrayList<>();
+    String emulator = System.getProperty("reliqa.emulator", "");
+    if (!emulator.isEmpty()) {
+      command.add(emulator);
+    }
+    command.add(java.nio.file.Path.of(System.getProperty("java.home"), "bin", "java").toString());
+    command.addAll(List.of("-Xcheck:jni",
+        "-Djava.library.path=" + System.getProperty("java.library.path"),
+        "-cp", System.getProperty("java.class.path"),
+        mainClass.getName()));
+    command.addAll(List.of(args));
+    return new ProcessBuilder(command).redirectErrorStream(true).start();
+  }
+
   static OptionalImageMetricValue metric(boolean calculated, double value) {
     return new OptionalImageMetricValue(calculated, value);
   }
@@ -84,6 +105,11 @@ final class Fixtures {
   }
 
   /** The native record that {@code input} must become, rendered like describeInput. */
+  /** A date as the native record holds it: where time_t has 32 bits, its low 32 bits. */
+  private static String recordDate(long seconds) {
+    return Long.toString(NativeReference.timeBits() == 32 ? (long) (int) seconds : seconds);
+  }
+
   static String describe(ReliqaClassifierInput input) {
     StringBuilder text = new StringBuilder();
     text.append("collectionID=").append(input.collectionID()).append('\n');
@@ -105,7 +131,7 @@ final class Fixtures {
         .append('\n');
     for (AssetDetail a : input.assetDetails()) {
       List<String> fields = new ArrayList<>(List.of(a.assetID(), a.assetType(),
-          Long.toString(a.creationDateSinceEpoch()), Long.toString(a.modificationDateSinceEpoch()),
+          recordDate(a.creationDateSinceEpoch()), recordDate(a.modificationDateSinceEpoch()),
           bits(a.pixelWidth()), bits(a.pixelHeight()), bits(a.latitude()), bits(a.longitude()),
           bits(a.videoDuration()), Integer.toString(a.isFavorite()),
           Integer.toString(a.isHidden()), Integer.toString(a.mediaSubtypes()),

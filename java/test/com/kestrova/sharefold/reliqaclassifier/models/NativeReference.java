@@ -14,6 +14,9 @@ final class NativeReference {
 
   private NativeReference() {}
 
+  /** The width of the native time_t in bits: 32 on 32-bit ARM, 64 elsewhere. */
+  static native int timeBits();
+
   /** The native record that the binding's input reader makes of {@code input}. */
   static native String describeInput(ReliqaClassifierInput input);
 

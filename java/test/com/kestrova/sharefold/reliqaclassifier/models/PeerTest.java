@@ -14,7 +14,6 @@ import java.lang.reflect.Modifier;
 import java.nio.charset.StandardCharsets;
 import java.nio.file.Path;
 import java.util.Arrays;
-import java.util.List;
 import java.util.Map;
 import java.util.Set;
 import java.util.TreeSet;
@@ -129,14 +128,7 @@ class PeerTest {
 
   @Test
   void attachingASecondPeerToAHolderAbortsTheProcess() throws Exception {
-    Process child = new ProcessBuilder(List.of(
-            Path.of(System.getProperty("java.home"), "bin", "java").toString(),
-            "-Xcheck:jni",
-            "-Djava.library.path=" + System.getProperty("java.library.path"),
-            "-cp", System.getProperty("java.class.path"),
-            PeerTest.class.getName()))
-        .redirectErrorStream(true)
-        .start();
+    Process child = Fixtures.startJvm(PeerTest.class);
     String output = new String(child.getInputStream().readAllBytes(), StandardCharsets.UTF_8);
     assertTrue(child.waitFor(120, TimeUnit.SECONDS), "child process hung");
     System.out.print(output);  // JNI warnings of the child reach the test log

@@ -6,10 +6,8 @@ import static org.junit.jupiter.api.Assertions.assertEquals;
 import static org.junit.jupiter.api.Assertions.assertTrue;
 
 import com.kestrova.keystash.PersistentKeyValueStore;
-import java.io.File;
 import java.nio.charset.StandardCharsets;
 import java.nio.file.Path;
-import java.util.List;
 import java.util.Map;
 import java.util.concurrent.TimeUnit;
 import org.junit.jupiter.api.Test;
@@ -32,14 +30,7 @@ class PersistenceTest {
   @Test
   void parametersSurviveTheProcess() throws Exception {
     String database = dir.resolve("store.db").toString();
-    Process writer = new ProcessBuilder(List.of(
-            System.getProperty("java.home") + File.separator + "bin" + File.separator + "java",
-            "-Xcheck:jni",
-            "-Djava.library.path=" + System.getProperty("java.library.path"),
-            "-cp", System.getProperty("java.class.path"),
-            PersistenceTest.class.getName(), database))
-        .redirectErrorStream(true)
-        .start();
+    Process writer = Fixtures.startJvm(PersistenceTest.class, database);
     assertTrue(writer.waitFor(120, TimeUnit.SECONDS), "writer process hung");
     String output = new String(writer.getInputStream().readAllBytes(), StandardCharsets.UTF_8);
     // The writer's output reaches the test log so that JNI warnings there are seen too.
