@@ -1,24 +1,42 @@
 #!/usr/bin/env bash
-# Checks the libraries scripts/package.sh put into dist/<ABI>/ (not
-# dist/<ABI>/symbols/) and prints a Markdown table of what the app ships.
-# Usage: scripts/check-libs.sh
-# Every library must have:
+# Checks the libraries an app ships and prints a Markdown table of them.
+# Usage: scripts/check-libs.sh [ABI=DIR ...]
+# Each DIR holds the stripped libraries of one ABI (x86_64, arm64 or armhf);
+# without arguments, the dist/<ABI>/ directories that scripts/package.sh wrote.
+# A DIR must hold exactly libreliqaclassifier.so and libkestrova_host.so (a
+# symbols/ directory beside them, with the unstripped copies, is checked too
+# where present), and every library must have:
+#   - the name lib<name>.so, and its file name as SONAME: Android packages only
+#     such files, and older Android versions find a library by file name;
+#   - no RUNPATH or RPATH: an app's libraries are found in its own directory;
+#   - no DT_NEEDED but the platform's C library (libc, libm, libdl and, with
+#     glibc, its loader, which holds part of the C library: bionic's libc has
+#     it all) and, for libreliqaclassifier.so, libkestrova_host.so: the
+#     dependencies and the C++ runtime are inside;
+#   - exported symbols of its own only: libreliqaclassifier.so exports exactly
+#     JNI_OnLoad and JNI_OnLoad_Weak, libkestrova_host.so its JNI_OnLoad and
+#     names in namespace kestrova (nothing of the runtime or the dependencies);
+#   - no test code (the failure-injecting store, the failing SQLite VFS), in
+#     the unstripped copy's symbol table;
 #   - LOAD segments aligned to at least 16 KB (phones with 16 KB pages);
 #   - no text relocations, a GNU_RELRO segment and BIND_NOW (full RELRO);
-#   - a build ID (crash reports are matched against dist/<ABI>/symbols/);
-#   - no RUNPATH or RPATH other than $ORIGIN;
-#   - every DT_NEEDED either shipped next to it or provided by the platform
-#     (the C library, the C++ runtime and the loader: on a phone these come
-#     with the platform and the NDK);
+#   - a build ID (crash reports are matched against the unstripped copies);
 #   - every symbol resolved when loaded with the libraries beside it (ldd -r
-#     for x86_64, the sysroot's loader under qemu for arm64 and armhf);
-# and libreliqaclassifier.so must export only JNI_OnLoad and JNI_OnLoad_Weak.
+#     for x86_64, the sysroot's loader under qemu for arm64 and armhf), and
+#     libkestrova_host.so taken from DIR, not from the machine.
 # Each violation is reported on standard error; the exit status is 1 if there
 # was any. The table goes to standard output.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
-. scripts/platform-libs.sh
+SHIPPED=(libkestrova_host.so libreliqaclassifier.so)
+
+is_platform_lib() {  # is_platform_lib <DT_NEEDED entry>
+  case "$1" in
+    libc.so.6 | libm.so.6 | libdl.so.2 | ld-linux-*.so.*) return 0 ;;
+    *) return 1 ;;
+  esac
+}
 
 failures=0
 fail() {  # fail <ABI>/<library> <what is wrong>
@@ -26,19 +44,19 @@ fail() {  # fail <ABI>/<library> <what is wrong>
   failures=$((failures + 1))
 }
 
-abis=()
-for dir in dist/*/; do
-  abi=$(basename "$dir")
-  case "$abi" in x86_64 | arm64 | armhf) abis+=("$abi") ;; esac
-done
-if [ ${#abis[@]} -eq 0 ]; then
+targets=("$@")
+if [ ${#targets[@]} -eq 0 ]; then
+  for abi in x86_64 arm64 armhf; do
+    [ -d "dist/$abi" ] && targets+=("$abi=dist/$abi")
+  done
+fi
+if [ ${#targets[@]} -eq 0 ]; then
   echo "check-libs: dist/ holds no ABI directory; run scripts/package.sh first" >&2
   exit 1
 fi
 
 # Loads <lib> with the libraries of its directory and prints what the loader
-# reports, the way ldd -r does.
-# $sysroot is the ABI's sysroot (none for x86_64).
+# reports, the way ldd -r does. $sysroot is the ABI's sysroot (none for x86_64).
 load_report() {  # load_report <ABI> <library>
   local abi=$1 lib=$2 dir
   dir=$(dirname "$lib")
@@ -52,24 +70,75 @@ load_report() {  # load_report <ABI> <library>
   esac
 }
 
+# Defined global and weak dynamic symbols, demangled, without versions.
+exported_symbols() {  # exported_symbols <library>
+  readelf -W --dyn-syms "$1" |
+    awk '$7 != "UND" && $7 != "Ndx" && ($5 == "GLOBAL" || $5 == "WEAK") && $4 != "SECTION" && $4 != "FILE" && $8 != "" { sub(/@.*/, "", $8); print $8 }' |
+    c++filt | sort -u
+}
+
 table="| ABI | Library | Stripped size (bytes) | DT_NEEDED |
 |---|---|---:|---|"
 totals=""
-for abi in "${abis[@]}"; do
-  libs=()
-  for f in dist/"$abi"/*.so*; do [ -f "$f" ] && libs+=("$f"); done
-  if [ ${#libs[@]} -eq 0 ]; then
-    fail "$abi" "dist/$abi holds no library"
-    continue
-  fi
+for target in "${targets[@]}"; do
+  abi=${target%%=*} dir=${target#*=}
+  case "$abi" in
+    x86_64 | arm64 | armhf) ;;
+    *) echo "check-libs: unknown ABI '$abi' in '$target' (x86_64, arm64 or armhf)" >&2; exit 2 ;;
+  esac
+  [ -d "$dir" ] || { echo "check-libs: $dir is not a directory" >&2; exit 2; }
   sysroot=""
   [ "$abi" = x86_64 ] || sysroot=$(bash scripts/sysroot.sh "$abi")
+
+  # Exactly the two libraries, each a lib<name>.so.
+  libs=()
+  for f in "$dir"/*; do
+    [ -d "$f" ] && [ "$(basename "$f")" = symbols ] && continue
+    name=$(basename "$f")
+    [[ "$name" =~ ^lib[A-Za-z0-9_]+\.so$ ]] || fail "$abi/$name" "is not named lib<name>.so"
+    case " ${SHIPPED[*]} " in
+      *" $name "*) libs+=("$f") ;;
+      *) fail "$abi/$name" "is shipped, but only ${SHIPPED[*]} are" ;;
+    esac
+  done
+  for name in "${SHIPPED[@]}"; do
+    [ -f "$dir/$name" ] || fail "$abi/$name" "is missing from $dir"
+  done
+
   total=0
   for lib in "${libs[@]}"; do
     name=$(basename "$lib")
     where=$abi/$name
     dynamic=$(readelf -dW "$lib")
     segments=$(readelf -lW "$lib")
+
+    soname=$(sed -n 's/.*(SONAME).*\[\(.*\)\]/\1/p' <<<"$dynamic")
+    [ "$soname" = "$name" ] || fail "$where" "has SONAME '${soname}', not its file name"
+    while read -r kind path; do
+      fail "$where" "has a $kind ('$path'): the app's libraries are found without one"
+    done < <(sed -n 's/.*(\(RUNPATH\|RPATH\)).*\[\(.*\)\]/\1 \2/p' <<<"$dynamic")
+
+    needed=$(sed -n 's/.*(NEEDED).*\[\(.*\)\]/\1/p' <<<"$dynamic")
+    for dep in $needed; do
+      is_platform_lib "$dep" && continue
+      [ "$name" = libreliqaclassifier.so ] && [ "$dep" = libkestrova_host.so ] && continue
+      fail "$where" "needs $dep, which is neither the platform's C library nor libkestrova_host.so"
+    done
+
+    exported=$(exported_symbols "$lib")
+    if [ "$name" = libreliqaclassifier.so ]; then
+      if [ "$(tr '\n' ' ' <<<"$exported")" != "JNI_OnLoad JNI_OnLoad_Weak " ]; then
+        fail "$where" "must export exactly JNI_OnLoad and JNI_OnLoad_Weak, but exports: $(tr '\n' ' ' <<<"$exported")"
+      fi
+    else
+      foreign=$(grep -vE '^(JNI_OnLoad|((typeinfo( name)?|vtable) for )?kestrova::.*)$' <<<"$exported" || true)
+      [ -z "$foreign" ] || fail "$where" "exports what is not its own: $(head -5 <<<"$foreign" | tr '\n' ';')"
+    fi
+
+    if [ -f "$dir/symbols/$name" ]; then
+      test_code=$(nm -C "$dir/symbols/$name" 2>/dev/null | grep -oE 'FaultInjectingKeyValueStore|FaultySqliteVfs' | sort -u || true)
+      [ -z "$test_code" ] || fail "$where" "contains test code: $(tr '\n' ' ' <<<"$test_code")"
+    fi
 
     # 16 KB pages: the alignment is the last column of each LOAD line.
     min_align=""
@@ -81,7 +150,6 @@ for abi in "${abis[@]}"; do
     elif [ "$min_align" -lt 16384 ]; then
       fail "$where" "a LOAD segment is aligned to $min_align bytes, less than 16384"
     fi
-
     if grep -qE '\(TEXTREL\)|\(FLAGS\).*TEXTREL' <<<"$dynamic"; then
       fail "$where" "has text relocations (TEXTREL)"
     fi
@@ -91,46 +159,16 @@ for abi in "${abis[@]}"; do
     fi
     readelf -nW "$lib" | grep -q 'Build ID' || fail "$where" "has no build ID note"
 
-    # Search paths: none, or only the library's own directory.
-    while read -r path; do
-      IFS=: read -ra entries <<<"$path"
-      for entry in "${entries[@]}"; do
-        case "$entry" in
-          '$ORIGIN' | '${ORIGIN}') ;;
-          *) fail "$where" "has a search path outside the package: '$entry'" ;;
-        esac
-      done
-    done < <(sed -n 's/.*(\(RUNPATH\|RPATH\)).*\[\(.*\)\]/\2/p' <<<"$dynamic")
-
-    needed=$(sed -n 's/.*(NEEDED).*\[\(.*\)\]/\1/p' <<<"$dynamic")
-    for dep in $needed; do
-      if ! is_system_lib "$dep" && [ ! -f "dist/$abi/$dep" ]; then
-        fail "$where" "needs $dep, which is neither shipped in dist/$abi nor a platform library"
-      fi
-    done
-
-    if [ "$name" = libreliqaclassifier.so ]; then
-      # Defined global and weak dynamic symbols, without version suffixes.
-      exported=$(readelf -W --dyn-syms "$lib" |
-        awk '$7 != "UND" && $7 != "Ndx" && ($5 == "GLOBAL" || $5 == "WEAK") && $4 != "SECTION" && $4 != "FILE" && $8 != "" { sub(/@.*/, "", $8); print $8 }' |
-        sort -u | tr '\n' ' ')
-      if [ "$exported" != "JNI_OnLoad JNI_OnLoad_Weak " ]; then
-        fail "$where" "must export exactly JNI_OnLoad and JNI_OnLoad_Weak, but exports: $exported"
-      fi
-    fi
-
     report=$(load_report "$abi" "$lib")
     if grep -q 'undefined symbol' <<<"$report"; then
       fail "$where" "has unresolved symbols: $(grep 'undefined symbol' <<<"$report" | head -5 | tr '\n' ';')"
     fi
-    # A library of ours must come from the package, not from the machine.
+    # libkestrova_host.so must come from the directory, not from the machine.
     while read -r dep path; do
-      is_system_lib "$dep" && continue
-      case "$path" in
-        "dist/$abi/"* | "$PWD/dist/$abi/"*) ;;
-        *) fail "$where" "loads $dep from $path instead of dist/$abi" ;;
-      esac
-    done < <(sed -n 's/^[[:space:]]*\([^ ]*\) => \(\/[^ ]*\|dist\/[^ ]*\).*/\1 \2/p' <<<"$report")
+      is_platform_lib "$dep" && continue
+      [ "$(realpath "$path" 2>/dev/null)" = "$(realpath "$dir/$dep")" ] ||
+        fail "$where" "loads $dep from $path instead of $dir"
+    done < <(sed -n 's/^[[:space:]]*\([^ ]*\) => \([^ ]*\) .*/\1 \2/p' <<<"$report")
     if grep -qE 'not found|error while loading|cannot open' <<<"$report"; then
       fail "$where" "cannot be loaded: $(grep -E 'not found|error while loading|cannot open' <<<"$report" | head -3 | tr '\n' ';')"
     fi

@@ -1,77 +1,48 @@
 #!/usr/bin/env bash
-# Packages the native libraries the app ships, per ABI, into dist/:
-#   dist/<ABI>/           stripped libreliqaclassifier.so, libkestrova_host.so
-#                         and every library they need (transitively) that the
-#                         platform does not provide
+# Packages what an app ships into dist/:
+#   dist/<ABI>/           the two stripped libraries: libreliqaclassifier.so and
+#                         libkestrova_host.so (the host's stand-in), each with
+#                         its dependencies and C++ runtime inside
 #   dist/<ABI>/symbols/   the same libraries unstripped (same build IDs), for
 #                         symbolising crash reports
 #   dist/reliqa.jar       the Java classes (the same for every ABI)
+#   dist/reliqa.aar       the Android library: AndroidManifest.xml,
+#                         classes.jar and jni/<Android ABI>/ with the stripped
+#                         libraries of x86_64, arm64-v8a and armeabi-v7a
 # Usage: scripts/package.sh
-# Every ABI whose build directory holds lib/libreliqaclassifier.so is packaged:
-# build/ (x86_64), build-arm64/, build-armhf/. The dependencies come from
-# scripts/build-deps.sh, which this script runs for each of those ABIs, never
-# from the machine: Debian's own binaries are not fit to ship.
-# The C library and the C++ runtime (and the dynamic loader) are left out: on
-# a phone they come with the platform and the NDK. scripts/check-libs.sh
-# checks the result.
+# It packages the shipped builds of scripts/build-abi.sh: build-x86_64/,
+# build-arm64/ and build-armhf/, all three (the archive holds every ABI).
+# scripts/check-libs.sh checks the result.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
 STRIP=$(command -v llvm-strip-14 || command -v llvm-strip || true)
 [ -n "$STRIP" ] || { echo "package: llvm-strip not found (run scripts/setup.sh)" >&2; exit 1; }
 
-. scripts/platform-libs.sh
-needed_of() {  # needed_of <library>: its DT_NEEDED entries, one a line
-  readelf -dW "$1" | sed -n 's/.*(NEEDED).*\[\(.*\)\]/\1/p'
-}
-
-abis=()
-for pair in x86_64:build arm64:build-arm64 armhf:build-armhf; do
-  [ -f "${pair#*:}/lib/libreliqaclassifier.so" ] && abis+=("$pair")
+LIBRARIES=(libreliqaclassifier.so libkestrova_host.so)
+ABIS=(x86_64 arm64 armhf)
+missing=()
+for abi in "${ABIS[@]}"; do
+  for name in "${LIBRARIES[@]}"; do
+    [ -f "build-$abi/lib/$name" ] || missing+=("build-$abi/lib/$name")
+  done
 done
-[ ${#abis[@]} -gt 0 ] || {
-  echo "package: no build directory holds lib/libreliqaclassifier.so; build the tree first" \
-       "(cmake --build build, or scripts/build-abi.sh arm64|armhf)" >&2
+if [ ${#missing[@]} -gt 0 ]; then
+  echo "package: missing ${missing[*]}; build each ABI with scripts/build-abi.sh x86_64|arm64|armhf" >&2
   exit 1
-}
-[ -f build/java/reliqa.jar ] || { echo "package: build/java/reliqa.jar is missing; build build/ first" >&2; exit 1; }
+fi
+[ -f build-x86_64/java/reliqa.jar ] || { echo "package: build-x86_64/java/reliqa.jar is missing" >&2; exit 1; }
 
 rm -rf dist
 mkdir -p dist
-cp build/java/reliqa.jar dist/reliqa.jar
-
-for pair in "${abis[@]}"; do
-  abi=${pair%%:*} build=${pair#*:}
-  prefix=$(bash scripts/build-deps.sh "$abi")
-  out=dist/$abi
-  mkdir -p "$out/symbols"
-  # Breadth-first over DT_NEEDED, starting from our two libraries; a name is
-  # looked up among our own libraries first, then among the rebuilt ones.
-  queue=(libreliqaclassifier.so libkestrova_host.so)
-  declare -A parent=([libreliqaclassifier.so]="" [libkestrova_host.so]="")
-  i=0
-  while [ "$i" -lt ${#queue[@]} ]; do
-    name=${queue[$i]}
-    i=$((i + 1))
-    src=""
-    for dir in "$build/lib" "$prefix/lib"; do
-      if [ -e "$dir/$name" ]; then src=$dir/$name; break; fi
-    done
-    if [ -z "$src" ]; then
-      echo "package: $abi: $name (needed by ${parent[$name]}) is not a platform library and is" \
-           "found neither in $build/lib nor in $prefix/lib" >&2
-      exit 1
-    fi
-    cp -L "$src" "$out/symbols/$name"
-    "$STRIP" --strip-all -o "$out/$name" "$out/symbols/$name"
-    for dep in $(needed_of "$out/symbols/$name"); do
-      is_system_lib "$dep" && continue
-      [ -n "${parent[$dep]+set}" ] && continue
-      parent[$dep]=$name
-      queue+=("$dep")
-    done
+cp build-x86_64/java/reliqa.jar dist/reliqa.jar
+for abi in "${ABIS[@]}"; do
+  mkdir -p "dist/$abi/symbols"
+  for name in "${LIBRARIES[@]}"; do
+    cp "build-$abi/lib/$name" "dist/$abi/symbols/$name"
+    "$STRIP" --strip-all -o "dist/$abi/$name" "dist/$abi/symbols/$name"
   done
-  unset parent
-  echo "package: $out: ${queue[*]}" >&2
 done
+/usr/bin/python3 scripts/aar.py write dist/reliqa.aar --classes dist/reliqa.jar \
+  --jni x86_64=dist/x86_64 --jni arm64-v8a=dist/arm64 --jni armeabi-v7a=dist/armhf
 echo "package: wrote dist/ (check it with scripts/check-libs.sh)" >&2

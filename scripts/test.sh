@@ -1,14 +1,19 @@
 #!/usr/bin/env bash
 # Runs every test of the project on a fresh Debian 12 machine:
-#   1. the GoogleTest suite (plain build, ctest),
+#   1. the GoogleTest suite (plain build: gcc, GNU's C++ runtime and the
+#      machine's libraries; ctest),
 #   2. the same suite built with AddressSanitizer + UndefinedBehaviorSanitizer,
 #   3. the same suite built with ThreadSanitizer,
 #   4. each libFuzzer target for FUZZ_SECONDS (default 60) on its seed corpus,
-#   5. the JVM suite and the trainer cross-check, when they are present,
-#   6. for arm64 and 32-bit ARM: a cross build, its GoogleTest suite and CLI
-#      tests under the emulator, and the example classified with the same
-#      output bytes as on this machine,
-#   7. the shippable libraries of every ABI, packaged and checked.
+#   5. the JVM suite on the plain build, and the trainer cross-check,
+#   6. for x86_64, arm64 and 32-bit ARM: the shipped configuration (LLVM's
+#      libc++ and every dependency linked in), its GoogleTest suite and CLI
+#      tests (arm64 and ARM under the emulator), and the example classified
+#      with the same output bytes as by the plain build,
+#   7. the shipped libraries of every ABI and the Android archive, packaged
+#      and checked,
+#   8. the JVM suite on every ABI against the packaged libraries (arm64 and
+#      ARM in their own Java runtime, under the emulator).
 # Any failure or sanitizer report makes it exit non-zero.
 set -euo pipefail
 cd "$(dirname "$0")/.."
@@ -75,18 +80,15 @@ for target in build-fuzz/bin/fuzz_*; do
   [ -d "$seeds" ] && cp -r "$seeds"/. "$work"/
   echo "-- $name"
   "$target" -max_total_time="$FUZZ_SECONDS" -timeout=10 -rss_limit_mb=2048 \
-    -print_final_stats=1 "$work" 2>&1 | tail -n 12
+    -artifact_prefix="$work/" -print_final_stats=1 "$work" 2>&1 | tail -n 12
   rm -rf "$work"
 done
 
-if [ -x scripts/test-java.sh ]; then
-  step "JVM tests"
-  bash scripts/test-java.sh build
-fi
-if [ -x scripts/test-crosscheck.sh ]; then
-  step "cross-check against the trainer"
-  bash scripts/test-crosscheck.sh build
-fi
+step "JVM tests (plain build)"
+bash scripts/test-java.sh build
+step "cross-check against the trainer"
+bash scripts/test-crosscheck.sh build
+
 # The example collection, classified by the reliqa of a build ($1) on a
 # fresh store; a cross build's runs through its emulator.
 classify_example() {
@@ -100,8 +102,8 @@ classify_example() {
 }
 
 expected=$(classify_example build)
-for abi in arm64 armhf; do
-  step "$abi: cross build and tests under the emulator"
+for abi in x86_64 arm64 armhf; do
+  step "$abi: shipped configuration and tests"
   bash scripts/build-abi.sh "$abi" -DRELIQA_WERROR=ON
   run_ctest "build-$abi"
   if [ "$(classify_example "build-$abi")" != "$expected" ]; then
@@ -111,8 +113,18 @@ for abi in arm64 armhf; do
   echo "the example classified by build-$abi/bin/reliqa: the same bytes as build/bin/reliqa"
 done
 
-step "shippable libraries"
+step "shipped libraries and the Android archive"
 bash scripts/package.sh
 bash scripts/check-libs.sh
+aar=$(mktemp -d)
+/usr/bin/python3 scripts/aar.py check dist/reliqa.aar --extract "$aar"
+bash scripts/check-libs.sh x86_64="$aar/jni/x86_64" arm64="$aar/jni/arm64-v8a" armhf="$aar/jni/armeabi-v7a" >/dev/null
+rm -rf "$aar"
+echo "dist/reliqa.aar: the layout is right and every library in it passes check-libs"
+
+for abi in x86_64 arm64 armhf; do
+  step "JVM tests ($abi, the packaged libraries)"
+  bash scripts/test-java.sh "build-$abi" "dist/$abi"
+done
 
 step "all tests passed"
