@@ -116,6 +116,7 @@ done
 step "shipped libraries and the Android archive"
 bash scripts/package.sh
 bash scripts/check-libs.sh
+bash scripts/test-check-libs.sh
 aar=$(mktemp -d)
 /usr/bin/python3 scripts/aar.py check dist/reliqa.aar --extract "$aar"
 bash scripts/check-libs.sh x86_64="$aar/jni/x86_64" arm64="$aar/jni/arm64-v8a" armhf="$aar/jni/armeabi-v7a" >/dev/null
