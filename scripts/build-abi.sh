@@ -5,8 +5,9 @@
 # is that of build/ (bin/, lib/, java/): the JNI libraries, the reliqa tool
 # and every test.
 #   scripts/build-abi.sh x86_64|arm64|armhf [extra cmake arguments]
-# x86_64 runs here; arm64 and armhf are cross-built against a Debian sysroot
-# and build-<ABI>/emulator runs their programs under qemu-user, e.g.
+# Each is built against a Debian sysroot of the ABI (scripts/sysroot.sh).
+# x86_64 runs here; build-<ABI>/emulator runs the programs of arm64 and armhf
+# under qemu-user, e.g.
 #   build-arm64/emulator build-arm64/bin/reliqa --help
 # ctest --test-dir build-<ABI> runs the tests (through the emulator).
 set -euo pipefail
@@ -20,8 +21,7 @@ esac
 
 bash scripts/setup.sh
 DEPS=$(bash scripts/build-deps.sh "$ABI")
-SYSROOT=""
-[ "$ABI" = x86_64 ] || SYSROOT=$(bash scripts/sysroot.sh "$ABI")
+SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 BUILD=build-$ABI
 # A build configured against another sysroot or other dependencies keeps
 # their compiler facts and paths: start it afresh.
@@ -35,4 +35,8 @@ cmake -S . -B "$BUILD" -G Ninja -Wno-dev \
   -DRELIQA_SYSROOT:PATH="$SYSROOT" -DRELIQA_DEPS:PATH="$DEPS" \
   -DCMAKE_BUILD_TYPE=RelWithDebInfo "$@" >/dev/null
 cmake --build "$BUILD" -j "${JOBS:-$(nproc)}"
-echo "build-abi: $BUILD is ready${SYSROOT:+; run its programs with $BUILD/emulator}" >&2
+if [ -x "$BUILD/emulator" ]; then
+  echo "build-abi: $BUILD is ready; run its programs with $BUILD/emulator" >&2
+else
+  echo "build-abi: $BUILD is ready" >&2
+fi

@@ -16,8 +16,8 @@
 # configuration (the machine's own Debian mirrors, as deb-src), so the
 # system's APT state is left alone. Sources and builds are cached under
 # ${XDG_CACHE_HOME:-~/.cache}/reliqa/, keyed by the ABI, the versions, the
-# flags, the toolchain files and this script, so a second run only prints the
-# prefix. Build logs go to <prefix>.build/<library>.log while building; JOBS
+# flags, the toolchain files and this script (less their comments), so a
+# second run only prints the prefix. Build logs go to <prefix>.build/<library>.log while building; JOBS
 # sets the build parallelism (default: the number of cores).
 set -euo pipefail
 cd "$(dirname "$0")/.."
@@ -60,14 +60,11 @@ version_of() {  # version_of <source package>
 }
 
 . scripts/cache-common.sh
-SYSROOT=""
-if [ "$ABI" != x86_64 ]; then
-  SYSROOT=$(bash scripts/sysroot.sh "$ABI")
-fi
+SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 TOOLCHAIN=$ROOT/cmake/toolchains/$ABI.cmake
 key=$( { echo "$ABI $SYSROOT"; printf '%s\n' "${versions[@]}"; echo "$CFLAGS_COMMON";
-         cat scripts/build-deps.sh scripts/cache-common.sh "$TOOLCHAIN" cmake/toolchains/libcxx-static.cmake;
-         [ "$ABI" = x86_64 ] || cat cmake/toolchains/cross-common.cmake; } |
+         key_text scripts/build-deps.sh scripts/cache-common.sh "$TOOLCHAIN" cmake/toolchains/shipped.cmake \
+                  cmake/toolchains/cross-common.cmake; } |
        sha256sum | cut -c1-12)
 PREFIX=$CACHE/deps-$ABI-$key
 if [ -f "$PREFIX/.complete" ]; then
@@ -131,11 +128,10 @@ CMAKE_COMMON=(
   # (some of these headers change class layouts without it).
   -DCMAKE_C_FLAGS_RELEASE=-DNDEBUG -DCMAKE_CXX_FLAGS_RELEASE=-DNDEBUG
   -DCMAKE_INSTALL_PREFIX="$PREFIX.tmp" -DCMAKE_INSTALL_LIBDIR=lib
-  -DRELIQA_DEPS="$PREFIX.tmp"
+  -DRELIQA_DEPS="$PREFIX.tmp" -DRELIQA_SYSROOT:PATH="$SYSROOT"
   -DBUILD_SHARED_LIBS=OFF -DCMAKE_POSITION_INDEPENDENT_CODE=ON
   -DBUILD_TESTING=OFF
 )
-[ "$ABI" = x86_64 ] || CMAKE_COMMON+=(-DRELIQA_SYSROOT:PATH="$SYSROOT")
 
 cmake_build() {  # cmake_build <name> <source dir> [cmake arguments]: configure, build, install
   local name=$1 src=$2 log=$BUILD/$1.log

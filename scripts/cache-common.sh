@@ -4,6 +4,13 @@
 # its place.
 CACHE=${XDG_CACHE_HOME:-$HOME/.cache}/reliqa
 
+# Prints the given files without their whole-line comments and blank lines:
+# what a cache key hashes of the scripts and files that make the directory,
+# so that editing a comment does not make it anew.
+key_text() {
+  grep -hv -e '^[[:space:]]*#' -e '^[[:space:]]*$' "$@" || true
+}
+
 # Prints the machine's configured Debian sources as one-line "deb" entries,
 # deb822 stanzas included (one line per URI and suite).
 debian_sources() {

@@ -5,7 +5,7 @@ set -euo pipefail
 
 PACKAGES=(
   build-essential cmake ninja-build pkg-config
-  clang libclang-rt-14-dev lld tzdata libc++-14-dev libc++abi-14-dev libunwind-14-dev
+  clang libclang-rt-14-dev lld tzdata
   mmdebstrap qemu-user-static llvm-14 tcl
   libgoogle-glog-dev libdouble-conversion-dev libfmt-dev libsimdjson-dev libsqlite3-dev
   libgtest-dev libgmock-dev libbenchmark-dev libcli11-dev

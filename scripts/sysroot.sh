@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # Makes (once) a Debian sysroot for a target ABI and prints its path.
-#   scripts/sysroot.sh arm64|armhf
+#   scripts/sysroot.sh x86_64|arm64|armhf
 # The sysroot holds what a phone's platform and NDK stand for: the target's C
 # library, LLVM's C++ runtime (libc++, libc++abi and libunwind, linked
 # statically), libgcc's builtins and the time zones; the header-only CLI11 the
@@ -8,20 +8,24 @@
 # suite under the emulator. Every other library the project uses is built from
 # source for the target by scripts/build-deps.sh. The packages are unpacked by
 # mmdebstrap from the machine's own Debian sources (nothing is installed on
-# this machine for another architecture). It is cached under ~/.cache/reliqa/ and made anew
+# this machine for another architecture). x86_64 has one too, without the
+# Java runtime (its programs run on this machine): LLVM's libunwind, which
+# libc++ needs, cannot be installed beside the libunwind that Debian's glog
+# package needs for the plain builds. It is cached under ~/.cache/reliqa/ and made anew
 # when the package list or the sources change.
 set -euo pipefail
-ABI=${1:?usage: $0 arm64|armhf}
+ABI=${1:?usage: $0 x86_64|arm64|armhf}
 case "$ABI" in
-  arm64 | armhf) ;;
-  *) echo "sysroot: unknown ABI '$ABI' (arm64 or armhf)" >&2; exit 2 ;;
+  x86_64) ARCH=amd64 ;;
+  arm64 | armhf) ARCH=$ABI ;;
+  *) echo "sysroot: unknown ABI '$ABI' (x86_64, arm64 or armhf)" >&2; exit 2 ;;
 esac
 
 PACKAGES=(
   libc6-dev libgcc-12-dev libc++-14-dev libc++abi-14-dev libunwind-14-dev tzdata
   libcli11-dev
-  openjdk-17-jre-headless
 )
+[ "$ABI" = x86_64 ] || PACKAGES+=(openjdk-17-jre-headless)
 
 cd "$(dirname "$0")/.."
 . scripts/cache-common.sh
@@ -31,7 +35,7 @@ trap 'rm -f "$sources" "$sources.nosec"' EXIT
 debian_sources >"$sources"
 [ -s "$sources" ] || { echo "sysroot: no Debian sources configured in /etc/apt" >&2; exit 1; }
 
-key=$( { echo "$ABI"; printf '%s\n' "${PACKAGES[@]}"; cat "$sources" scripts/sysroot.sh scripts/cache-common.sh; } |
+key=$( { echo "$ABI"; printf '%s\n' "${PACKAGES[@]}"; cat "$sources"; key_text scripts/sysroot.sh scripts/cache-common.sh; } |
        sha256sum | cut -c1-12)
 ROOT=$CACHE/sysroot-$ABI-$key
 if [ -f "$ROOT/.complete" ]; then
@@ -43,7 +47,7 @@ mkdir -p "$CACHE"
 rm -rf "$ROOT" "$ROOT.tmp"
 include=$(IFS=,; echo "${PACKAGES[*]}")
 unpack() {  # unpack <sources file>
-  mmdebstrap --quiet --variant=extract --arch="$ABI" --include="$include" \
+  mmdebstrap --quiet --variant=extract --arch="$ARCH" --include="$include" \
     "$(. /etc/os-release && echo "$VERSION_CODENAME")" "$ROOT.tmp" "$1" >&2
 }
 echo "sysroot: unpacking $ABI packages into $ROOT" >&2
