@@ -9,6 +9,7 @@
 #include <jni.h>
 
 #include <algorithm>
+#include <chrono>
 #include <cstring>
 #include <ctime>
 #include <iterator>
@@ -146,6 +147,42 @@ jobject failingStore(JNIEnv* env, jclass) {
   });
 }
 
+// static native long classifyNatively(PersistentKeyValueStore store, ReliqaClassifierInput input,
+//                                     int iterations)
+// For the JVM benchmark: reads `input` once, then classifies the native record
+// `iterations` times with a fresh classifier over `store`'s native store, as
+// classifyReliqa does after reading; returns the nanoseconds the loop took.
+jlong classifyNatively(JNIEnv* env, jclass, jobject store, jobject input, jint iterations) {
+  return entryPoint<jlong>(env, [&] {
+    static const PeerClass peerClass = PeerClass::describe(store, managed::kStore);
+    auto* storePeer = PersistentKeyValueStoreHybrid::fromNativePointer(findPeer(store, peerClass));
+    ReliqasClassifier classifier(storePeer->store());
+    const ReliqaClassifierInput record = readReliqaClassifierInput(input);
+    const auto start = std::chrono::steady_clock::now();
+    for (jint i = 0; i < iterations; ++i) {
+      ReliqaClassifierResult result = classifier.classify(record);
+      asm volatile("" : : "r"(&result) : "memory");  // the result is used
+    }
+    return static_cast<jlong>(
+        std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now() - start).count());
+  });
+}
+
+// static native long readNatively(ReliqaClassifierInput input, int iterations)
+// For the JVM benchmark: reads `input` into a native record `iterations`
+// times; returns the nanoseconds the loop took.
+jlong readNatively(JNIEnv* env, jclass, jobject input, jint iterations) {
+  return entryPoint<jlong>(env, [&] {
+    const auto start = std::chrono::steady_clock::now();
+    for (jint i = 0; i < iterations; ++i) {
+      ReliqaClassifierInput record = readReliqaClassifierInput(input);
+      asm volatile("" : : "r"(&record) : "memory");
+    }
+    return static_cast<jlong>(
+        std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now() - start).count());
+  });
+}
+
 // A registration that fails: the class has no such native.
 void registerMissingNative() {
   static const JNINativeMethod methods[] = {
@@ -209,6 +246,13 @@ void registerNatives() {
        reinterpret_cast<void*>(&initializeWithFailingRegistration)},
       {const_cast<char*>("attachTwice"), const_cast<char*>("()V"),
        reinterpret_cast<void*>(&attachTwice)},
+      {const_cast<char*>("classifyNatively"),
+       const_cast<char*>("(Lcom/kestrova/keystash/PersistentKeyValueStore;"
+                         "Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;I)J"),
+       reinterpret_cast<void*>(&classifyNatively)},
+      {const_cast<char*>("readNatively"),
+       const_cast<char*>("(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;I)J"),
+       reinterpret_cast<void*>(&readNatively)},
       {const_cast<char*>("failingStore"), const_cast<char*>("()Lcom/kestrova/keystash/PersistentKeyValueStore;"),
        reinterpret_cast<void*>(&failingStore)},
   };

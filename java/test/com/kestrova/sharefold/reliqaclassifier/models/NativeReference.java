@@ -44,4 +44,15 @@ final class NativeReference {
    * so its failures reach the classifier library from another copy of the C++ runtime.
    */
   static native PersistentKeyValueStore failingStore();
+
+  /**
+   * For the JVM benchmark: reads {@code input} once, classifies the native record {@code
+   * iterations} times with a new native classifier over {@code store}, and returns the nanoseconds
+   * the native loop took.
+   */
+  static native long classifyNatively(
+      PersistentKeyValueStore store, ReliqaClassifierInput input, int iterations);
+
+  /** For the JVM benchmark: reads {@code input} natively {@code iterations} times; nanoseconds. */
+  static native long readNatively(ReliqaClassifierInput input, int iterations);
 }
