@@ -79,7 +79,7 @@ void BM_Predict50(benchmark::State& state) {
   const thornvale::BoostingModel model(benchmarkModel());
   FeatureMap features = kServerFeatures;
   const FeatureMap computed = extractFeatures(collectionOf(50));
-  features.insert(computed.begin(), computed.end());
+  for (const auto& [id, value] : computed) features.emplace(id, value);
   for (auto _ : state) benchmark::DoNotOptimize(model.predict(features));
 }
 BENCHMARK(BM_Predict50);

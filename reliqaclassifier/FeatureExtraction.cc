@@ -8,9 +8,6 @@ namespace {
 
 using thornvale::FeatureMap;
 
-// Initial bucket count of the feature map.
-constexpr size_t kBucketHint = 10;
-
 // The features come in seven groups with disjoint ids; each group adds its
 // features to the map.
 
@@ -113,7 +110,7 @@ void addSize(FeatureMap& features, const CollectionStatistics& stats) {
 
 FeatureMap extractFeatures(const ReliqaClassifierInput& input) {
   const CollectionStatistics stats = gatherCollectionStatistics(input);
-  FeatureMap features(kBucketHint);
+  FeatureMap features;
   addCounts(features, input);
   addLocation(features, input, stats);
   addTime(features, input, stats);

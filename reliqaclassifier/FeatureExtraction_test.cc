@@ -66,7 +66,7 @@ TEST(FeatureExtractionTest, WorkedExample) {
   EXPECT_DOUBLE_EQ(features.at(66), 50.1);
   EXPECT_DOUBLE_EQ(features.at(67), 49.9);
   EXPECT_DOUBLE_EQ(features.at(70), 99.8);
-  EXPECT_EQ(features.count(2), 0u);
+  EXPECT_FALSE(features.contains(2));
   EXPECT_EQ(features.size(), 73u);
 }
 
@@ -78,7 +78,7 @@ TEST(FeatureExtractionTest, EmptyCollectionGivesDefaultsCountsAndOptionalLandmar
   input.extraCount = 4294967295u;
   FeatureMap features = extractFeatures(input);
   EXPECT_EQ(features.size(), 73u);
-  EXPECT_EQ(features.count(2), 0u);
+  EXPECT_FALSE(features.contains(2));
   for (int32_t id = 13; id <= 73; ++id) {
     if (id != 60) {
       EXPECT_EQ(features.at(id), -1.0) << id;

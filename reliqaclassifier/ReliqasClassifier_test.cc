@@ -5,7 +5,6 @@
 #include <spawn.h>
 #include <sys/wait.h>
 
-#include <algorithm>
 #include <atomic>
 #include <cmath>
 #include <cstdlib>
@@ -76,7 +75,7 @@ double scoreOf(const std::string& modelText, const FeatureMap& features) {
 FeatureMap merged(const FeatureMap& server, const ReliqaClassifierInput& input) {
   FeatureMap features = server;
   FeatureMap computed = extractFeatures(input);
-  features.insert(computed.begin(), computed.end());
+  for (const auto& [id, value] : computed) features.emplace(id, value);
   return features;
 }
 
@@ -128,7 +127,7 @@ TEST_F(ReliqasClassifierTest, ServerFeaturesReplaceComputedOnesAndAreReplacedAsA
   classifier.setServerFeatures({{2000, 1.0}});
   vector = featureVectorOf(classifier.classify(collection()));
   EXPECT_EQ(vector.at(4), 3.0);
-  EXPECT_EQ(vector.count(1000), 0u);
+  EXPECT_FALSE(vector.contains(1000));
   EXPECT_EQ(memory->peek("RELIQA_server_features"), "{\"2000\":1}");
 }
 
@@ -323,10 +322,9 @@ TEST(ReliqasClassifierConcurrencyTest, ResultsMatchSomeStateThatExisted) {
   using Key = std::tuple<std::string, std::string, std::string, std::vector<std::pair<int32_t, double>>>;
   auto key = [](const ReliqaClassifierResult& result) {
     FeatureMap vector = featureVectorOf(result);
-    std::vector<std::pair<int32_t, double>> sorted(vector.begin(), vector.end());
-    std::sort(sorted.begin(), sorted.end());
     return Key(result.loggingData.at("score"), result.loggingData.at("model_id"),
-               result.loggingData.at("threshold") + (result.isOverThreshold ? ">" : "<="), sorted);
+               result.loggingData.at("threshold") + (result.isOverThreshold ? ">" : "<="),
+               std::vector<std::pair<int32_t, double>>(vector.begin(), vector.end()));
   };
   std::set<Key> updatedAnswers;
   std::set<Key> sharingAnswers;
