@@ -94,7 +94,9 @@ TEST_F(ReliqasClassifierTest, WithoutModelEverythingIsAcceptedWithDefaultLogging
   ReliqaClassifierResult result = classifier.classify(collection());
   EXPECT_EQ(result.score, 1.0);
   EXPECT_TRUE(result.isOverThreshold);
-  EXPECT_EQ(result.loggingData.size(), 4u);
+  std::vector<std::string> keys;
+  for (const auto& [key, value] : result.loggingData) keys.push_back(key);
+  EXPECT_THAT(keys, ElementsAre("score", "model_id", "feature_vector", "threshold"));
   EXPECT_EQ(result.loggingData.at("score"), "1");
   EXPECT_EQ(result.loggingData.at("threshold"), "0");
   EXPECT_EQ(result.loggingData.at("model_id"), "");
@@ -112,13 +114,19 @@ TEST_F(ReliqasClassifierTest, WithoutModelEverythingIsAcceptedWithDefaultLogging
 TEST_F(ReliqasClassifierTest, ServerFeaturesReplaceComputedOnesAndAreReplacedAsAWhole) {
   ReliqasClassifier classifier(store);
   classifier.setModelParams({modelA, "a", 0.5});
-  classifier.setServerFeatures({{4, 9.0}, {1000, 2.5}});
+  classifier.setServerFeatures({{4, 9.0}, {1000, 2.5}, {-1, 0.5}});
   ReliqaClassifierResult result = classifier.classify(collection());
+  // Members by ascending id: server ids below and above the computed ones
+  // take their places around them.
+  const std::string& text = result.loggingData.at("feature_vector");
+  EXPECT_THAT(text, ::testing::StartsWith("{\"-1\":0.5,\"1\":2.5,"));
+  EXPECT_THAT(text, ::testing::HasSubstr(",\"3\":0,\"4\":9,\"5\":0,"));
+  EXPECT_THAT(text, ::testing::EndsWith(",\"74\":0,\"1000\":2.5}"));
   FeatureMap vector = featureVectorOf(result);
   EXPECT_EQ(vector.at(4), 9.0);      // not the computed 3
   EXPECT_EQ(vector.at(1000), 2.5);   // unused by the model, still logged
   EXPECT_EQ(vector.at(1), 2.5);      // computed features stay
-  EXPECT_EQ(vector.size(), 74u);
+  EXPECT_EQ(vector.size(), 75u);
   EXPECT_EQ(result.score, scoreOf(modelA, {{4, 9.0}}));
   EXPECT_NE(result.score, scoreOf(modelA, {{4, 3.0}}));
   EXPECT_TRUE(result.isOverThreshold);
