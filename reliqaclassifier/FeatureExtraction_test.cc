@@ -97,6 +97,18 @@ TEST(FeatureExtractionTest, EmptyCollectionGivesDefaultsCountsAndOptionalLandmar
   EXPECT_EQ(extractFeatures(input).at(2), 0.0);
 }
 
+// Duplicate pairs are counted on their own, also beyond the number of assets.
+TEST(FeatureExtractionTest, DuplicatePairsNeedNoAssets) {
+  ReliqaClassifierInput input;
+  input.duplicateInfos = {{"a", "b", 0.5}, {"c", "d", 0.25}, {"e", "f", 0.75}};
+  FeatureMap features = extractFeatures(input);
+  EXPECT_EQ(features.at(58), 0.5);
+  EXPECT_EQ(features.at(59), std::sqrt(0.125 / 3));
+  EXPECT_EQ(features.at(61), -1.0);
+  input.assetDetails = {asset(0, -1)};
+  EXPECT_EQ(extractFeatures(input).at(59), std::sqrt(0.125 / 3));
+}
+
 TEST(FeatureExtractionTest, OneAssetHasNoSpread) {
   ReliqaClassifierInput input;
   AssetDetail only = asset(86400 + 5 * 3600, 86400 + 6 * 3600);
