@@ -16,9 +16,7 @@ constexpr int64_t kMaxModeSpan = int64_t{1} << 30;
 template <typename T>
 double meanOf(const ValueList<T>& values) {
   if (values.empty()) return kEmpty;
-  double sum = 0.0;
-  for (T value : values) sum += static_cast<double>(value);
-  return sum / static_cast<double>(values.size());
+  return values.sum() / static_cast<double>(values.size());
 }
 
 template <typename T>
