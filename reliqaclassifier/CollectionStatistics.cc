@@ -1,5 +1,6 @@
 #include "reliqaclassifier/CollectionStatistics.h"
 
+#include <cassert>
 #include <ctime>
 
 namespace kestrova::reliqaclassifier {
@@ -7,6 +8,10 @@ namespace {
 
 // Stands in for a metric that was not calculated.
 constexpr double kUncalculatedMetric = 100.0;
+
+// How many of lists 1 to 19 hold doubles and how many integers.
+constexpr size_t kDoubleAssetLists = 14;
+constexpr size_t kIntAssetLists = 5;
 
 // Modification date of an asset whose modification is unknown.
 constexpr time_t kUnknownDate = -1;
@@ -22,20 +27,45 @@ double editDelayOf(time_t created, time_t modified) {
 
 }  // namespace
 
-CollectionStatistics gatherCollectionStatistics(const ReliqaClassifierInput& input) {
-  CollectionStatistics stats;
-  const size_t assets = input.assetDetails.size();
-  for (auto* list : {&stats.creationDates, &stats.widths, &stats.heights, &stats.latitudes, &stats.longitudes,
-                     &stats.videoDurations, &stats.modificationDates, &stats.knownModificationDates,
-                     &stats.knownEditDelays, &stats.editDelays, &stats.calculatedBlurriness, &stats.blurriness,
-                     &stats.calculatedDarkness, &stats.darkness}) {
-    list->reserve(assets);
-  }
-  for (auto* list : {&stats.creationHours, &stats.favoriteFlags, &stats.hiddenFlags, &stats.mediaSubtypes,
-                     &stats.sourceTypes}) {
-    list->reserve(assets);
-  }
+// Lists 1 to 19 take a share of `assets` values each, kDoubleAssetLists of
+// doubles and kIntAssetLists of integers, and list 20 a share of
+// `duplicatePairs` doubles.
+CollectionStatistics::CollectionStatistics(size_t assets, size_t duplicatePairs)
+    : doubleRoom(new double[kDoubleAssetLists * assets + duplicatePairs]),
+      intRoom(new int32_t[kIntAssetLists * assets]) {
+  double* nextDouble = doubleRoom.get();
+  int32_t* nextInt = intRoom.get();
+  auto share = [](auto*& next, size_t count) {
+    auto* room = next;
+    next += count;
+    return ValueList(room);
+  };
+  creationDates = share(nextDouble, assets);
+  creationHours = share(nextInt, assets);
+  widths = share(nextDouble, assets);
+  heights = share(nextDouble, assets);
+  latitudes = share(nextDouble, assets);
+  longitudes = share(nextDouble, assets);
+  videoDurations = share(nextDouble, assets);
+  modificationDates = share(nextDouble, assets);
+  knownModificationDates = share(nextDouble, assets);
+  knownEditDelays = share(nextDouble, assets);
+  editDelays = share(nextDouble, assets);
+  favoriteFlags = share(nextInt, assets);
+  hiddenFlags = share(nextInt, assets);
+  mediaSubtypes = share(nextInt, assets);
+  sourceTypes = share(nextInt, assets);
+  calculatedBlurriness = share(nextDouble, assets);
+  blurriness = share(nextDouble, assets);
+  calculatedDarkness = share(nextDouble, assets);
+  darkness = share(nextDouble, assets);
+  duplicateCoefficients = share(nextDouble, duplicatePairs);
+  assert(nextDouble == doubleRoom.get() + kDoubleAssetLists * assets + duplicatePairs);
+  assert(nextInt == intRoom.get() + kIntAssetLists * assets);
+}
 
+CollectionStatistics gatherCollectionStatistics(const ReliqaClassifierInput& input) {
+  CollectionStatistics stats(input.assetDetails.size(), input.duplicateInfos.size());
   for (const AssetDetail& asset : input.assetDetails) {
     const time_t created = asset.creationDateSinceEpoch;
     const time_t modified = asset.modificationDateSinceEpoch;
@@ -67,7 +97,6 @@ CollectionStatistics gatherCollectionStatistics(const ReliqaClassifierInput& inp
     stats.darkness.push_back(asset.darknessMetric.isCalculated ? asset.darknessMetric.value : kUncalculatedMetric);
   }
 
-  stats.duplicateCoefficients.reserve(input.duplicateInfos.size());
   for (const DuplicateInfo& duplicate : input.duplicateInfos) {
     stats.duplicateCoefficients.push_back(duplicate.dupeCoefficient);
   }

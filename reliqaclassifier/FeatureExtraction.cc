@@ -8,15 +8,12 @@ namespace {
 
 using thornvale::FeatureMap;
 
-// Initial bucket count of the feature map.
-constexpr size_t kBucketHint = 10;
-
 // The features come in seven groups with disjoint ids; each group adds its
 // features to the map.
 
 // Adds mean and standard deviation of `values` as `meanId` and `meanId + 1`.
 template <typename T>
-void addMeanAndDeviation(FeatureMap& features, int32_t meanId, const std::vector<T>& values) {
+void addMeanAndDeviation(FeatureMap& features, int32_t meanId, const ValueList<T>& values) {
   const MeanAndDeviation summary = meanAndDeviation(values);
   features.emplace(meanId, summary.mean);
   features.emplace(meanId + 1, summary.deviation);
@@ -84,7 +81,7 @@ void addFlags(FeatureMap& features, const CollectionStatistics& stats) {
 
 // Features 48 to 59 and 61 to 70: image metrics and duplicate coefficients.
 void addQuality(FeatureMap& features, const CollectionStatistics& stats) {
-  auto describe = [&features](int32_t firstId, const std::vector<double>& values) {
+  auto describe = [&features](int32_t firstId, const ValueList<double>& values) {
     addMeanAndDeviation(features, firstId, values);
     features.emplace(firstId + 2, minimum(values));
     features.emplace(firstId + 3, maximum(values));
@@ -113,7 +110,7 @@ void addSize(FeatureMap& features, const CollectionStatistics& stats) {
 
 FeatureMap extractFeatures(const ReliqaClassifierInput& input) {
   const CollectionStatistics stats = gatherCollectionStatistics(input);
-  FeatureMap features(kBucketHint);
+  FeatureMap features;
   addCounts(features, input);
   addLocation(features, input, stats);
   addTime(features, input, stats);

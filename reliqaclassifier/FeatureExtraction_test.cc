@@ -66,7 +66,7 @@ TEST(FeatureExtractionTest, WorkedExample) {
   EXPECT_DOUBLE_EQ(features.at(66), 50.1);
   EXPECT_DOUBLE_EQ(features.at(67), 49.9);
   EXPECT_DOUBLE_EQ(features.at(70), 99.8);
-  EXPECT_EQ(features.count(2), 0u);
+  EXPECT_FALSE(features.contains(2));
   EXPECT_EQ(features.size(), 73u);
 }
 
@@ -78,7 +78,7 @@ TEST(FeatureExtractionTest, EmptyCollectionGivesDefaultsCountsAndOptionalLandmar
   input.extraCount = 4294967295u;
   FeatureMap features = extractFeatures(input);
   EXPECT_EQ(features.size(), 73u);
-  EXPECT_EQ(features.count(2), 0u);
+  EXPECT_FALSE(features.contains(2));
   for (int32_t id = 13; id <= 73; ++id) {
     if (id != 60) {
       EXPECT_EQ(features.at(id), -1.0) << id;
@@ -95,6 +95,18 @@ TEST(FeatureExtractionTest, EmptyCollectionGivesDefaultsCountsAndOptionalLandmar
   EXPECT_EQ(extractFeatures(input).at(2), 1.0);
   input.locationInfo->isLandmark = false;
   EXPECT_EQ(extractFeatures(input).at(2), 0.0);
+}
+
+// Duplicate pairs are counted on their own, also beyond the number of assets.
+TEST(FeatureExtractionTest, DuplicatePairsNeedNoAssets) {
+  ReliqaClassifierInput input;
+  input.duplicateInfos = {{"a", "b", 0.5}, {"c", "d", 0.25}, {"e", "f", 0.75}};
+  FeatureMap features = extractFeatures(input);
+  EXPECT_EQ(features.at(58), 0.5);
+  EXPECT_EQ(features.at(59), std::sqrt(0.125 / 3));
+  EXPECT_EQ(features.at(61), -1.0);
+  input.assetDetails = {asset(0, -1)};
+  EXPECT_EQ(extractFeatures(input).at(59), std::sqrt(0.125 / 3));
 }
 
 TEST(FeatureExtractionTest, OneAssetHasNoSpread) {

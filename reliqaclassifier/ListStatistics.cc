@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <new>
+#include <vector>
 
 namespace kestrova::reliqaclassifier {
 namespace {
@@ -13,15 +14,13 @@ constexpr double kEmpty = -1.0;
 constexpr int64_t kMaxModeSpan = int64_t{1} << 30;
 
 template <typename T>
-double meanOf(const std::vector<T>& values) {
+double meanOf(const ValueList<T>& values) {
   if (values.empty()) return kEmpty;
-  double sum = 0.0;
-  for (T value : values) sum += static_cast<double>(value);
-  return sum / static_cast<double>(values.size());
+  return values.sum() / static_cast<double>(values.size());
 }
 
 template <typename T>
-MeanAndDeviation meanAndDeviationOf(const std::vector<T>& values) {
+MeanAndDeviation meanAndDeviationOf(const ValueList<T>& values) {
   if (values.empty()) return {kEmpty, kEmpty};
   const double average = meanOf(values);
   double sumOfSquares = 0.0;
@@ -33,20 +32,20 @@ MeanAndDeviation meanAndDeviationOf(const std::vector<T>& values) {
 }
 
 template <typename T>
-double minimumOf(const std::vector<T>& values) {
+double minimumOf(const ValueList<T>& values) {
   if (values.empty()) return kEmpty;
   return static_cast<double>(*std::min_element(values.begin(), values.end()));
 }
 
 template <typename T>
-double maximumOf(const std::vector<T>& values) {
+double maximumOf(const ValueList<T>& values) {
   if (values.empty()) return kEmpty;
   return static_cast<double>(*std::max_element(values.begin(), values.end()));
 }
 
 // The smallest of the most frequent values, counted in a dense histogram of
 // the span [lowest, lowest + span) at `counts` (zeroed).
-double denseMode(const std::vector<int32_t>& values, int32_t lowest, size_t span, uint32_t* counts) {
+double denseMode(const ValueList<int32_t>& values, int32_t lowest, size_t span, uint32_t* counts) {
   for (int32_t value : values) ++counts[static_cast<size_t>(int64_t{value} - lowest)];
   size_t best = 0;
   for (size_t i = 1; i < span; ++i) {
@@ -74,29 +73,29 @@ double sortedMode(std::vector<int32_t> values) {
 
 }  // namespace
 
-double mean(const std::vector<double>& values) { return meanOf(values); }
-double mean(const std::vector<int32_t>& values) { return meanOf(values); }
-double standardDeviation(const std::vector<double>& values) { return meanAndDeviationOf(values).deviation; }
-double standardDeviation(const std::vector<int32_t>& values) { return meanAndDeviationOf(values).deviation; }
-MeanAndDeviation meanAndDeviation(const std::vector<double>& values) { return meanAndDeviationOf(values); }
-MeanAndDeviation meanAndDeviation(const std::vector<int32_t>& values) { return meanAndDeviationOf(values); }
-double minimum(const std::vector<double>& values) { return minimumOf(values); }
-double minimum(const std::vector<int32_t>& values) { return minimumOf(values); }
-double maximum(const std::vector<double>& values) { return maximumOf(values); }
-double maximum(const std::vector<int32_t>& values) { return maximumOf(values); }
+double mean(const ValueList<double>& values) { return meanOf(values); }
+double mean(const ValueList<int32_t>& values) { return meanOf(values); }
+double standardDeviation(const ValueList<double>& values) { return meanAndDeviationOf(values).deviation; }
+double standardDeviation(const ValueList<int32_t>& values) { return meanAndDeviationOf(values).deviation; }
+MeanAndDeviation meanAndDeviation(const ValueList<double>& values) { return meanAndDeviationOf(values); }
+MeanAndDeviation meanAndDeviation(const ValueList<int32_t>& values) { return meanAndDeviationOf(values); }
+double minimum(const ValueList<double>& values) { return minimumOf(values); }
+double minimum(const ValueList<int32_t>& values) { return minimumOf(values); }
+double maximum(const ValueList<double>& values) { return maximumOf(values); }
+double maximum(const ValueList<int32_t>& values) { return maximumOf(values); }
 
-double range(const std::vector<double>& values) {
+double range(const ValueList<double>& values) {
   if (values.empty()) return kEmpty;
   return maximumOf(values) - minimumOf(values);
 }
 
-double range(const std::vector<int32_t>& values) {
+double range(const ValueList<int32_t>& values) {
   if (values.empty()) return kEmpty;
   auto [lowest, highest] = std::minmax_element(values.begin(), values.end());
   return static_cast<double>(int64_t{*highest} - int64_t{*lowest});
 }
 
-double mode(const std::vector<int32_t>& values) {
+double mode(const ValueList<int32_t>& values) {
   if (values.empty()) return kEmpty;
   auto [lowest, highest] = std::minmax_element(values.begin(), values.end());
   const int64_t span = int64_t{*highest} - int64_t{*lowest} + 1;
@@ -114,7 +113,7 @@ double mode(const std::vector<int32_t>& values) {
     std::vector<uint32_t> counts(static_cast<size_t>(span), 0);
     return denseMode(values, *lowest, counts.size(), counts.data());
   }
-  return sortedMode(values);
+  return sortedMode(std::vector<int32_t>(values.begin(), values.end()));
 }
 
 }  // namespace kestrova::reliqaclassifier

@@ -17,33 +17,34 @@
 #pragma once
 
 #include <cstdint>
-#include <vector>
+
+#include "reliqaclassifier/ValueList.h"
 
 namespace kestrova::reliqaclassifier {
 
-double mean(const std::vector<double>& values);
-double mean(const std::vector<int32_t>& values);
+double mean(const ValueList<double>& values);
+double mean(const ValueList<int32_t>& values);
 
-double standardDeviation(const std::vector<double>& values);
-double standardDeviation(const std::vector<int32_t>& values);
+double standardDeviation(const ValueList<double>& values);
+double standardDeviation(const ValueList<int32_t>& values);
 
 // mean and standardDeviation together, the mean computed once.
 struct MeanAndDeviation {
   double mean;
   double deviation;
 };
-MeanAndDeviation meanAndDeviation(const std::vector<double>& values);
-MeanAndDeviation meanAndDeviation(const std::vector<int32_t>& values);
+MeanAndDeviation meanAndDeviation(const ValueList<double>& values);
+MeanAndDeviation meanAndDeviation(const ValueList<int32_t>& values);
 
-double minimum(const std::vector<double>& values);
-double minimum(const std::vector<int32_t>& values);
+double minimum(const ValueList<double>& values);
+double minimum(const ValueList<int32_t>& values);
 
-double maximum(const std::vector<double>& values);
-double maximum(const std::vector<int32_t>& values);
+double maximum(const ValueList<double>& values);
+double maximum(const ValueList<int32_t>& values);
 
-double range(const std::vector<double>& values);
-double range(const std::vector<int32_t>& values);
+double range(const ValueList<double>& values);
+double range(const ValueList<int32_t>& values);
 
-double mode(const std::vector<int32_t>& values);
+double mode(const ValueList<int32_t>& values);
 
 }  // namespace kestrova::reliqaclassifier

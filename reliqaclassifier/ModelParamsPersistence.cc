@@ -28,7 +28,7 @@ void storeServerFeatures(CacheManager& cache, const FeatureMap& features) {
 }
 
 FeatureMap fetchServerFeatures(CacheManager& cache) {
-  return cache.fetch(kServerFeaturesKey, FeatureMap(10));
+  return cache.fetch(kServerFeaturesKey, FeatureMap());
 }
 
 }  // namespace kestrova::reliqaclassifier

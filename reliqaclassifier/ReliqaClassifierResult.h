@@ -7,8 +7,8 @@
 #pragma once
 
 #include <array>
-#include <string>
-#include <unordered_map>
+
+#include "reliqaclassifier/LoggingData.h"
 
 namespace kestrova::reliqaclassifier {
 
@@ -23,7 +23,7 @@ inline constexpr std::array<const char*, 4> kLoggingDataKeys = {
 struct ReliqaClassifierResult {
   bool isOverThreshold = false;  // score > threshold, strictly
   double score = 0.0;            // the model's probability, or 1.0 without a model
-  std::unordered_map<std::string, std::string> loggingData;
+  LoggingData loggingData;       // the four keys in the order of kLoggingDataKeys
 };
 
 }  // namespace kestrova::reliqaclassifier

@@ -5,7 +5,6 @@
 #include <spawn.h>
 #include <sys/wait.h>
 
-#include <algorithm>
 #include <atomic>
 #include <cmath>
 #include <cstdlib>
@@ -76,7 +75,7 @@ double scoreOf(const std::string& modelText, const FeatureMap& features) {
 FeatureMap merged(const FeatureMap& server, const ReliqaClassifierInput& input) {
   FeatureMap features = server;
   FeatureMap computed = extractFeatures(input);
-  features.insert(computed.begin(), computed.end());
+  for (const auto& [id, value] : computed) features.emplace(id, value);
   return features;
 }
 
@@ -95,7 +94,9 @@ TEST_F(ReliqasClassifierTest, WithoutModelEverythingIsAcceptedWithDefaultLogging
   ReliqaClassifierResult result = classifier.classify(collection());
   EXPECT_EQ(result.score, 1.0);
   EXPECT_TRUE(result.isOverThreshold);
-  EXPECT_EQ(result.loggingData.size(), 4u);
+  std::vector<std::string> keys;
+  for (const auto& [key, value] : result.loggingData) keys.push_back(key);
+  EXPECT_THAT(keys, ElementsAre("score", "model_id", "feature_vector", "threshold"));
   EXPECT_EQ(result.loggingData.at("score"), "1");
   EXPECT_EQ(result.loggingData.at("threshold"), "0");
   EXPECT_EQ(result.loggingData.at("model_id"), "");
@@ -113,13 +114,19 @@ TEST_F(ReliqasClassifierTest, WithoutModelEverythingIsAcceptedWithDefaultLogging
 TEST_F(ReliqasClassifierTest, ServerFeaturesReplaceComputedOnesAndAreReplacedAsAWhole) {
   ReliqasClassifier classifier(store);
   classifier.setModelParams({modelA, "a", 0.5});
-  classifier.setServerFeatures({{4, 9.0}, {1000, 2.5}});
+  classifier.setServerFeatures({{4, 9.0}, {1000, 2.5}, {-1, 0.5}});
   ReliqaClassifierResult result = classifier.classify(collection());
+  // Members by ascending id: server ids below and above the computed ones
+  // take their places around them.
+  const std::string& text = result.loggingData.at("feature_vector");
+  EXPECT_THAT(text, ::testing::StartsWith("{\"-1\":0.5,\"1\":2.5,"));
+  EXPECT_THAT(text, ::testing::HasSubstr(",\"3\":0,\"4\":9,\"5\":0,"));
+  EXPECT_THAT(text, ::testing::EndsWith(",\"74\":0,\"1000\":2.5}"));
   FeatureMap vector = featureVectorOf(result);
   EXPECT_EQ(vector.at(4), 9.0);      // not the computed 3
   EXPECT_EQ(vector.at(1000), 2.5);   // unused by the model, still logged
   EXPECT_EQ(vector.at(1), 2.5);      // computed features stay
-  EXPECT_EQ(vector.size(), 74u);
+  EXPECT_EQ(vector.size(), 75u);
   EXPECT_EQ(result.score, scoreOf(modelA, {{4, 9.0}}));
   EXPECT_NE(result.score, scoreOf(modelA, {{4, 3.0}}));
   EXPECT_TRUE(result.isOverThreshold);
@@ -128,7 +135,7 @@ TEST_F(ReliqasClassifierTest, ServerFeaturesReplaceComputedOnesAndAreReplacedAsA
   classifier.setServerFeatures({{2000, 1.0}});
   vector = featureVectorOf(classifier.classify(collection()));
   EXPECT_EQ(vector.at(4), 3.0);
-  EXPECT_EQ(vector.count(1000), 0u);
+  EXPECT_FALSE(vector.contains(1000));
   EXPECT_EQ(memory->peek("RELIQA_server_features"), "{\"2000\":1}");
 }
 
@@ -323,10 +330,9 @@ TEST(ReliqasClassifierConcurrencyTest, ResultsMatchSomeStateThatExisted) {
   using Key = std::tuple<std::string, std::string, std::string, std::vector<std::pair<int32_t, double>>>;
   auto key = [](const ReliqaClassifierResult& result) {
     FeatureMap vector = featureVectorOf(result);
-    std::vector<std::pair<int32_t, double>> sorted(vector.begin(), vector.end());
-    std::sort(sorted.begin(), sorted.end());
     return Key(result.loggingData.at("score"), result.loggingData.at("model_id"),
-               result.loggingData.at("threshold") + (result.isOverThreshold ? ">" : "<="), sorted);
+               result.loggingData.at("threshold") + (result.isOverThreshold ? ">" : "<="),
+               std::vector<std::pair<int32_t, double>>(vector.begin(), vector.end()));
   };
   std::set<Key> updatedAnswers;
   std::set<Key> sharingAnswers;

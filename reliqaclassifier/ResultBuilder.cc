@@ -18,7 +18,6 @@ ReliqaClassifierResult buildResult(const thornvale::FeatureMap& features, const 
   ReliqaClassifierResult result;
   result.score = score;
   result.isOverThreshold = score > threshold;
-  result.loggingData = std::unordered_map<std::string, std::string>(10);
   result.loggingData.emplace(kScoreLoggingKey, thornvale::doubleToText(score));
   result.loggingData.emplace(kModelIdLoggingKey, std::move(modelId));
   result.loggingData.emplace(kFeatureVectorLoggingKey, thornvale::featureMapToJson(features));

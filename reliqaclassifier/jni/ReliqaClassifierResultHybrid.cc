@@ -46,13 +46,7 @@ jbyteArray getValueFromLoggingDataWithKey(JNIEnv* env, jobject self, jstring key
       throwNullPointer("logging data key");
     }
     std::string name = jni::JString(key).toStdString();
-    const ReliqaClassifierResult& result = resultOf(self);
-    auto entry = result.loggingData.find(name);
-    if (entry == result.loggingData.end()) {
-      // The message of the standard hash map's at() for a missing key.
-      throw std::out_of_range("_Map_base::at");
-    }
-    return jni::make_byte_array(entry->second).release();
+    return jni::make_byte_array(resultOf(self).loggingData.at(name)).release();
   });
 }
 

@@ -213,9 +213,10 @@ class ModelGuard(Tool):
         self.assertEqual((r["loggingData"]["model_id"], r["loggingData"]["threshold"]), ("b", "0.99"))
 
     def test_server_features_replace_and_refusals_keep_them(self):
-        self.ok("set-server-features", self.path("sf.json", {"1": "9.5", "01": "7", "300": 2}))
+        self.ok("set-server-features", self.path("sf.json", {"300": 2, "1": "9.5", "01": "7", "-4": 1}))
         fv = json.loads(self.classify(collection())["loggingData"]["feature_vector"])
-        self.assertEqual((fv["1"], fv["300"]), (9.5, 2))
+        self.assertEqual((fv["1"], fv["300"], fv["-4"]), (9.5, 2, 1))
+        self.assertEqual(list(fv), [str(i) for i in sorted(int(k) for k in fv)])  # members by ascending id
         before = self.classify(collection())
         self.refused("set-server-features", self.path("nan.json", {"2": "nan"}), pattern=r"reads as NaN")
         # Values the store would keep but never give back: every later classify would fail.

@@ -113,14 +113,12 @@ void writeResultJson(const rc::ReliqaClassifierResult& r, std::string& s) {
   s += r.isOverThreshold ? "true" : "false";
   s += ",\"loggingData\":{";
   bool first = true;
-  for (const char* key : {"score", "model_id", "feature_vector", "threshold"}) {
-    auto it = r.loggingData.find(key);
-    if (it == r.loggingData.end()) continue;
+  for (const auto& [key, value] : r.loggingData) {
     if (!first) s += ',';
     first = false;
     appendJsonString(s, key);
     s += ':';
-    appendJsonString(s, it->second);
+    appendJsonString(s, value);
   }
   s += "}}";
 }

@@ -53,7 +53,7 @@ TEST(ServerFeatures, ValuesFollowStrtodAndTheFirstKeyWins) {
   FeatureMap f = parseServerFeatures(
       R"({"12": "0.5", "5": "2.5kg", "05": "9", "7": "letters", "8": 1.25e2, "9": -0, "4294967296": "1"})", "sf");
   EXPECT_EQ(f, (FeatureMap{{12, 0.5}, {5, 2.5}, {7, 0.0}, {8, 125.0}, {9, 0.0}}));
-  EXPECT_TRUE(std::signbit(f[9]));  // a JSON number is taken by its text
+  EXPECT_TRUE(std::signbit(f.at(9)));  // a JSON number is taken by its text
 }
 
 TEST(ServerFeatures, RefusesWhatTheStoreWouldNotGiveBack) {

@@ -5,8 +5,9 @@
 //   std::string  the bytes unchanged;
 //   double       the JSON number text ("0.7", "1"); read back as a number text
 //                (NumberText.h);
-//   FeatureMap   a compact JSON object {"<id>":<number>,...} (JsonWriter.h),
-//                read back as FeatureMapJson.h describes.
+//   FeatureMap   a compact JSON object {"<id>":<number>,...}, members by
+//                ascending id (JsonWriter.h), read back as FeatureMapJson.h
+//                describes (members in any order).
 //
 // Failures of the store never leave the cache: a missing store handle or a
 // std::exception thrown by the store (or by its future) is logged at ERROR and

@@ -54,6 +54,16 @@ TEST_F(CacheManagerTest, EncodesEachTypeUnderThePrefixedKey) {
   EXPECT_TRUE(log.entries().empty());
 }
 
+// Earlier builds stored the members in no particular order: such an entry reads
+// back by the old rules and is written back by ascending id.
+TEST_F(CacheManagerTest, ServerFeaturesOfAnyMemberOrderReadBackAndAreRewrittenInOrder) {
+  memory->put("RELIQA_server_features", R"({"1000":1,"4":2,"-3":0.5,"04":9,"71":7,"4":3})");
+  const FeatureMap read = cache.fetch("server_features", FeatureMap{});
+  EXPECT_EQ(read, (FeatureMap{{-3, 0.5}, {4, 3.0}, {71, 7.0}, {1000, 1.0}}));
+  cache.store("server_features", read);
+  EXPECT_EQ(memory->peek("RELIQA_server_features"), R"({"-3":0.5,"4":3,"71":7,"1000":1})");
+}
+
 TEST_F(CacheManagerTest, UndecodableValuesThrowInsteadOfDefaultingAndLogNothing) {
   memory->put("RELIQA_threshold", "abc");
   EXPECT_THROW(cache.fetch("threshold", 0.0), ConversionError);

@@ -216,7 +216,7 @@ FeatureMap featureMapFromJson(std::string_view json) {
     failParse("parsing didn't consume all input");
   }
 
-  FeatureMap features(members.size());
+  FeatureMap features;
   for (const Member& member : members) {
     auto id = static_cast<int32_t>(textToInt64(member.name));
     double value = asDouble(member.value);

@@ -42,8 +42,9 @@ TEST(JsonWriterTest, WritesCompactObjectsWithShortestNumbers) {
   EXPECT_EQ(featureMapToJson({}), "{}");
   EXPECT_EQ(featureMapToJson({{-3, -1.0}}), "{\"-3\":-1}");
   EXPECT_EQ(featureMapToJson({{7, 1e-7}}), "{\"7\":1E-7}");
-  std::string two = featureMapToJson({{3, 2.0}, {48, 0.25}});
-  EXPECT_TRUE(two == "{\"3\":2,\"48\":0.25}" || two == "{\"48\":0.25,\"3\":2}") << two;
+  // Members by ascending id, negative ids first, whatever order they came in.
+  EXPECT_EQ(featureMapToJson({{75, 1.0}, {48, 0.25}, {-1, 0.5}, {3, 2.0}}),
+            "{\"-1\":0.5,\"3\":2,\"48\":0.25,\"75\":1}");
   EXPECT_EQ(doubleToJson(0.7), "0.7");
   EXPECT_EQ(doubleToJson(-0.0), "-0");
 }

@@ -5,7 +5,7 @@ add_library(reliqa_json STATIC
   ${CMAKE_CURRENT_LIST_DIR}/JsonWriter.cc
   ${CMAKE_CURRENT_LIST_DIR}/FeatureMapJson.cc)
 target_include_directories(reliqa_json PUBLIC ${PROJECT_SOURCE_DIR})
-target_link_libraries(reliqa_json PUBLIC double-conversion::double-conversion PRIVATE simdjson::simdjson)
+target_link_libraries(reliqa_json PUBLIC feature_map double-conversion::double-conversion PRIVATE simdjson::simdjson)
 
 add_library(reliqa_cache STATIC ${CMAKE_CURRENT_LIST_DIR}/CacheManager.cc)
 target_link_libraries(reliqa_cache PUBLIC reliqa_json keystash_interface PRIVATE glog::glog fmt::fmt)

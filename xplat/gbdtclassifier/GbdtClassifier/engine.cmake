@@ -9,7 +9,7 @@ add_library(gbdt STATIC
   FastTreeEnsembleSimd.cc
   CompleteTreeWalk.cc)
 target_include_directories(gbdt PUBLIC ${PROJECT_SOURCE_DIR})
-target_link_libraries(gbdt PUBLIC glog::glog)
+target_link_libraries(gbdt PUBLIC feature_map glog::glog)
 
 foreach(test IN ITEMS
     BoostingModel/NodeArena_test

@@ -75,7 +75,7 @@ public final class ReliqaClassifierResult implements AutoCloseable {
 
   /**
    * Every logging value, as an unmodifiable map in the order in which the native side lists its
-   * keys.
+   * keys: score, model_id, feature_vector, threshold.
    *
    * @throws IllegalStateException if this result is closed
    */

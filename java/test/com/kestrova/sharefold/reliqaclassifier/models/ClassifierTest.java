@@ -115,8 +115,7 @@ class ClassifierTest {
       for (byte[] key : keys) {
         names.add(new String(key, StandardCharsets.UTF_8));
       }
-      assertEquals(List.of("feature_vector", "model_id", "score", "threshold"),
-          names.stream().sorted().toList());
+      assertEquals(List.of("score", "model_id", "feature_vector", "threshold"), names);
       Map<String, String> data = result.getLoggingData();
       assertEquals(names, List.copyOf(data.keySet()));
       for (String name : names) {
