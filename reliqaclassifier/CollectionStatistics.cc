@@ -2,6 +2,8 @@
 
 #include <cassert>
 #include <ctime>
+#include <limits>
+#include <new>
 
 namespace kestrova::reliqaclassifier {
 namespace {
@@ -25,14 +27,24 @@ double editDelayOf(time_t created, time_t modified) {
   return difftime(modified, created);
 }
 
+// The number of values of `count` lists of `length` each and `extra` more,
+// refused (as memory that cannot be had) where size_t cannot hold it: on a
+// 32-bit phone the product could wrap around to a small room.
+template <typename T>
+size_t roomFor(size_t count, size_t length, size_t extra) {
+  const size_t most = std::numeric_limits<size_t>::max() / sizeof(T);
+  if (extra > most || length > (most - extra) / count) throw std::bad_alloc();
+  return count * length + extra;
+}
+
 }  // namespace
 
 // Lists 1 to 19 take a share of `assets` values each, kDoubleAssetLists of
 // doubles and kIntAssetLists of integers, and list 20 a share of
 // `duplicatePairs` doubles.
 CollectionStatistics::CollectionStatistics(size_t assets, size_t duplicatePairs)
-    : doubleRoom(new double[kDoubleAssetLists * assets + duplicatePairs]),
-      intRoom(new int32_t[kIntAssetLists * assets]) {
+    : doubleRoom(new double[roomFor<double>(kDoubleAssetLists, assets, duplicatePairs)]),
+      intRoom(new int32_t[roomFor<int32_t>(kIntAssetLists, assets, 0)]) {
   double* nextDouble = doubleRoom.get();
   int32_t* nextInt = intRoom.get();
   auto share = [](auto*& next, size_t count) {
