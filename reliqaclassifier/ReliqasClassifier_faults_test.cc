@@ -23,7 +23,7 @@
 #include "host/keystash/SqliteKeyValueStore.h"
 #include "host/keystash/testing/TemporaryDirectory.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
-#include "reliqaclassifier/TestModels.h"
+#include "reliqaclassifier/testing/TestModels.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
 
 namespace kestrova::reliqaclassifier {

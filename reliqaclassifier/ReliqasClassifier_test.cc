@@ -20,7 +20,7 @@
 #include "host/keystash/PersistentKeyValueStore.h"
 #include "host/keystash/testing/TemporaryDirectory.h"
 #include "reliqaclassifier/FeatureExtraction.h"
-#include "reliqaclassifier/TestModels.h"
+#include "reliqaclassifier/testing/TestModels.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMapJson.h"
