@@ -42,10 +42,6 @@ DEPS=(
   "googletest        libgtest-dev             libgtest.a libgtest_main.a libgmock.a"
 )
 
-# Optimisation and hardening as the project's optimised builds have them; the
-# toolchain file adds the rest (runtime, visibility, sections, no contraction).
-CFLAGS_COMMON="-O2 -fPIC -fstack-protector-strong -D_FORTIFY_SOURCE=2"
-
 versions=()
 for entry in "${DEPS[@]}"; do
   read -r src dev _ <<<"$entry"
@@ -62,9 +58,9 @@ version_of() {  # version_of <source package>
 . scripts/cache-common.sh
 SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 TOOLCHAIN=$ROOT/cmake/toolchains/$ABI.cmake
-key=$( { echo "$ABI $SYSROOT"; printf '%s\n' "${versions[@]}"; echo "$CFLAGS_COMMON";
+key=$( { echo "$ABI $SYSROOT"; printf '%s\n' "${versions[@]}";
          key_text scripts/build-deps.sh scripts/cache-common.sh "$TOOLCHAIN" cmake/toolchains/shipped.cmake \
-                  cmake/toolchains/cross-common.cmake; } |
+                  cmake/toolchains/cross-common.cmake cmake/BuildFlags.cmake; } |
        sha256sum | cut -c1-12)
 PREFIX=$CACHE/deps-$ABI-$key
 if [ -f "$PREFIX/.complete" ]; then
@@ -118,15 +114,16 @@ done
 BUILD=$PREFIX.build
 rm -rf "$PREFIX" "$PREFIX.tmp" "$BUILD"
 mkdir -p "$PREFIX.tmp" "$BUILD"
-# CMake starts CMAKE_<LANG>_FLAGS from these and adds the toolchain's flags.
-export CFLAGS="$CFLAGS_COMMON" CXXFLAGS="$CFLAGS_COMMON"
+# The toolchain file gives every compile the project's flags (runtime,
+# visibility, sections, no contraction, hardening).
 CMAKE_COMMON=(
   -G Ninja -Wno-dev
   -DCMAKE_TOOLCHAIN_FILE="$TOOLCHAIN"
   -DCMAKE_BUILD_TYPE=Release
-  # Release without its -O3: the -O2 above applies. NDEBUG as Debian has it
-  # (some of these headers change class layouts without it).
-  -DCMAKE_C_FLAGS_RELEASE=-DNDEBUG -DCMAKE_CXX_FLAGS_RELEASE=-DNDEBUG
+  # Release with -O2 instead of its -O3, as the project's optimised builds.
+  # NDEBUG as Debian has it (some of these headers change class layouts
+  # without it).
+  "-DCMAKE_C_FLAGS_RELEASE=-O2 -DNDEBUG" "-DCMAKE_CXX_FLAGS_RELEASE=-O2 -DNDEBUG"
   -DCMAKE_INSTALL_PREFIX="$PREFIX.tmp" -DCMAKE_INSTALL_LIBDIR=lib
   -DRELIQA_DEPS="$PREFIX.tmp" -DRELIQA_SYSROOT:PATH="$SYSROOT"
   -DBUILD_SHARED_LIBS=OFF -DCMAKE_POSITION_INDEPENDENT_CODE=ON
@@ -168,13 +165,18 @@ src=$(unpack_source googletest "$(version_of googletest)")
 cmake_build googletest "$src" -DBUILD_GMOCK=ON -DINSTALL_GTEST=ON
 
 # SQLite: Debian's source is the full tree. Its amalgamation (sqlite3.c) is
-# generated once on this machine, from the patched tree, and compiled per
-# ABI with the feature options of debian/rules.
+# generated once on this machine, from the patched tree, with the configure
+# options of debian/rules. Its feature options are Debian's too, read from the
+# source package: the -D flags of debian/rules' CFLAGS and those that configure
+# adds for the options given to it (OPT_FEATURE_FLAGS of the Makefile it
+# writes). What configure learns of the C library is given below instead: it
+# is the same for every target (glibc here, bionic on a phone), and configure
+# would also pick up libraries of this machine that the app does not have.
 src=$(unpack_source sqlite3 "$(version_of sqlite3)")
 amalg=$src/.amalgamation
-if [ ! -f "$amalg/sqlite3.c" ]; then
+if [ ! -f "$amalg/sqlite3.c" ] || [ ! -f "$amalg/features" ]; then
   echo "build-deps: generating the SQLite amalgamation" >&2
-  rm -rf "$amalg.tmp"
+  rm -rf "$amalg" "$amalg.tmp"
   mkdir -p "$amalg.tmp"
   if ! (cd "$amalg.tmp" && "$src/configure" --enable-threadsafe --enable-load-extension \
           --enable-json --enable-fts4 --enable-fts5 --disable-tcl &&
@@ -183,8 +185,18 @@ if [ ! -f "$amalg/sqlite3.c" ]; then
     echo "build-deps: generating the SQLite amalgamation failed (is tclsh installed?)" >&2
     exit 1
   fi
+  { sed -n '/^export CFLAGS += /,/[^\\]$/p' "$src/debian/rules"
+    sed -n 's/^OPT_FEATURE_FLAGS *= *//p' "$amalg.tmp/Makefile"; } |
+    { grep -oE -- '-DSQLITE_[A-Z0-9_]+(=[0-9]+)?' || true; } | sed 's/^-D//' >"$amalg.tmp/features"
+  # The shapes read above are Debian's; if they change, say so rather than
+  # build a different SQLite.
+  if ! grep -qx 'SQLITE_THREADSAFE=1' "$amalg.tmp/features" || ! grep -qx 'SQLITE_ENABLE_FTS5' "$amalg.tmp/features"; then
+    echo "build-deps: could not read SQLite's feature options from debian/rules and the configured" \
+         "Makefile of $src (found: $(tr '\n' ' ' <"$amalg.tmp/features"))" >&2
+    exit 1
+  fi
   mkdir -p "$amalg"
-  cp "$amalg.tmp/sqlite3.c" "$amalg.tmp/sqlite3.h" "$amalg.tmp/sqlite3ext.h" "$amalg/"
+  cp "$amalg.tmp/sqlite3.c" "$amalg.tmp/sqlite3.h" "$amalg.tmp/sqlite3ext.h" "$amalg.tmp/features" "$amalg/"
   rm -rf "$amalg.tmp"
 fi
 mkdir -p "$BUILD/sqlite3-src"
@@ -194,28 +206,9 @@ project(sqlite3 C)
 add_library(sqlite3 STATIC "$amalg/sqlite3.c")
 target_compile_options(sqlite3 PRIVATE -fno-strict-aliasing)
 target_compile_definitions(sqlite3 PRIVATE
-  # debian/rules CFLAGS
-  SQLITE_SECURE_DELETE SQLITE_ENABLE_COLUMN_METADATA
-  SQLITE_ENABLE_FTS3 SQLITE_ENABLE_FTS3_PARENTHESIS
-  SQLITE_ENABLE_RTREE=1 SQLITE_SOUNDEX=1
-  SQLITE_ENABLE_UNLOCK_NOTIFY
-  SQLITE_OMIT_LOOKASIDE=1 SQLITE_ENABLE_DBSTAT_VTAB
-  SQLITE_ALLOW_ROWID_IN_VIEW
-  SQLITE_ENABLE_UPDATE_DELETE_LIMIT=1
-  SQLITE_ENABLE_LOAD_EXTENSION
-  SQLITE_ENABLE_JSON1
-  SQLITE_LIKE_DOESNT_MATCH_BLOBS
-  SQLITE_THREADSAFE=1
-  SQLITE_ENABLE_FTS3_TOKENIZER=1
-  SQLITE_USE_URI=1
-  SQLITE_MAX_SCHEMA_RETRY=25
-  SQLITE_ENABLE_PREUPDATE_HOOK
-  SQLITE_ENABLE_SESSION
-  SQLITE_ENABLE_STMTVTAB
-  SQLITE_MAX_VARIABLE_NUMBER=250000
-  # what its configure options (--enable-fts4 --enable-fts5 --enable-math
-  # default) and checks of the C library add
-  SQLITE_ENABLE_FTS4 SQLITE_ENABLE_FTS5 SQLITE_ENABLE_MATH_FUNCTIONS
+  # Debian's feature options
+  $(tr '\n' ' ' <"$amalg/features")
+  # the C library
   _REENTRANT=1 HAVE_USLEEP=1 HAVE_FDATASYNC=1 HAVE_LOCALTIME_R=1 HAVE_GMTIME_R=1
   HAVE_ISNAN=1 HAVE_STRCHRNUL=1 HAVE_POSIX_FALLOCATE=1 HAVE_UTIME=1
   HAVE_DECL_STRERROR_R=1 HAVE_STRERROR_R=1 HAVE_STDINT_H=1 HAVE_INTTYPES_H=1)

@@ -39,7 +39,12 @@ set(CMAKE_C_COMPILER_TARGET ${RELIQA_TRIPLE})
 set(CMAKE_CXX_COMPILER_TARGET ${RELIQA_TRIPLE})
 set(_llvm "${RELIQA_SYSROOT}/usr/lib/llvm-14")
 
-set(_flags "${RELIQA_TARGET_FLAGS} -ffp-contract=off -ffunction-sections -fdata-sections -fvisibility=hidden")
+# Every compile starts with the project's code and hardening flags (an
+# optimised build: the shipped configuration is never a debug one).
+include(${CMAKE_CURRENT_LIST_DIR}/../BuildFlags.cmake)
+list(JOIN RELIQA_CODE_FLAGS " " _code)
+list(JOIN RELIQA_HARDENING_FLAGS " " _hardening)
+set(_flags "${RELIQA_TARGET_FLAGS} ${_code} ${_hardening} -fvisibility=hidden")
 set(CMAKE_C_FLAGS_INIT "${_flags}")
 set(CMAKE_CXX_FLAGS_INIT "${_flags} -fvisibility-inlines-hidden \
 --start-no-unused-arguments -nostdinc++ --end-no-unused-arguments -isystem ${_llvm}/include/c++/v1")
