@@ -38,14 +38,15 @@ debian_sources() {
 }
 
 # Moves the finished <dir>.tmp to <dir>, marked complete, and removes the
-# older directories of the same kind (<dir> up to its last "-", the key),
-# which an older key made and nothing uses any more. Prints <dir>.
+# older complete directories of the same kind (<dir> up to its last "-", the
+# key), which an older key made and nothing uses any more. A directory that is
+# not complete (another run's, still at work) is left alone. Prints <dir>.
 publish_cached() {  # publish_cached <dir>
   local dir=$1 old
-  for old in "${dir%-*}"-*; do
-    [ "$old" = "$dir.tmp" ] || rm -rf "$old"
-  done
   touch "$dir.tmp/.complete"
   mv "$dir.tmp" "$dir"
+  for old in "${dir%-*}"-*; do
+    [ "$old" != "$dir" ] && [ -f "$old/.complete" ] && rm -rf "$old"
+  done
   echo "$dir"
 }
