@@ -9,7 +9,8 @@
 # x86_64 runs here; build-<ABI>/emulator runs the programs of arm64 and armhf
 # under qemu-user, e.g.
 #   build-arm64/emulator build-arm64/bin/reliqa --help
-# ctest --test-dir build-<ABI> runs the tests (through the emulator).
+# ctest --preset <ABI> runs the tests (through the emulator), among them the
+# checks of what ships and the JVM suite.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 ABI=${1:?usage: $0 x86_64|arm64|armhf [cmake arguments]}
@@ -20,21 +21,20 @@ case "$ABI" in
 esac
 
 bash scripts/setup.sh
-DEPS=$(bash scripts/build-deps.sh "$ABI")
-SYSROOT=$(bash scripts/sysroot.sh "$ABI")
+# The preset of the ABI (CMakePresets.json) reads both from the environment.
+export RELIQA_DEPS RELIQA_SYSROOT
+RELIQA_DEPS=$(bash scripts/build-deps.sh "$ABI")
+RELIQA_SYSROOT=$(bash scripts/sysroot.sh "$ABI")
 BUILD=build-$ABI
 # A build configured against another sysroot or other dependencies keeps
 # their compiler facts and paths: start it afresh.
 if [ -f "$BUILD/CMakeCache.txt" ] &&
-   ! { grep -qxF "RELIQA_SYSROOT:PATH=$SYSROOT" "$BUILD/CMakeCache.txt" &&
-       grep -qxF "RELIQA_DEPS:PATH=$DEPS" "$BUILD/CMakeCache.txt"; }; then
+   ! { grep -qxF "RELIQA_SYSROOT:PATH=$RELIQA_SYSROOT" "$BUILD/CMakeCache.txt" &&
+       grep -qxF "RELIQA_DEPS:PATH=$RELIQA_DEPS" "$BUILD/CMakeCache.txt"; }; then
   rm -rf "$BUILD/CMakeCache.txt" "$BUILD/CMakeFiles"
 fi
-cmake -S . -B "$BUILD" -G Ninja -Wno-dev \
-  -DCMAKE_TOOLCHAIN_FILE="$PWD/cmake/toolchains/$ABI.cmake" \
-  -DRELIQA_SYSROOT:PATH="$SYSROOT" -DRELIQA_DEPS:PATH="$DEPS" \
-  -DCMAKE_BUILD_TYPE=RelWithDebInfo "$@" >/dev/null
-cmake --build "$BUILD" -j "${JOBS:-$(nproc)}"
+cmake --preset "$ABI" "$@" >/dev/null
+cmake --build --preset "$ABI" -j "${JOBS:-$(nproc)}"
 if [ -x "$BUILD/emulator" ]; then
   echo "build-abi: $BUILD is ready; run its programs with $BUILD/emulator" >&2
 else

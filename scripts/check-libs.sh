@@ -1,11 +1,13 @@
 #!/usr/bin/env bash
 # Checks the libraries an app ships and prints a Markdown table of them.
-# Usage: scripts/check-libs.sh [ABI=DIR ...]
-# Each DIR holds the stripped libraries of one ABI (x86_64, arm64 or armhf);
-# without arguments, the dist/<ABI>/ directories that scripts/package.sh wrote.
+# Usage: scripts/check-libs.sh [BUILD[=DIR] ...]
+# BUILD is a build of the shipped configuration (build-x86_64, build-arm64,
+# build-armhf; its name after "build-" is the ABI), DIR the directory of the
+# stripped libraries to check (default: BUILD/stripped, which the build's test
+# shipped_libraries checks). Without arguments: build-<ABI>=dist/<ABI> for
+# every dist/<ABI>/ that scripts/package.sh wrote.
 # A DIR must hold exactly libreliqaclassifier.so and libkestrova_host.so (a
-# symbols/ directory beside them, with the unstripped copies, is checked too
-# where present), and every library must have:
+# symbols/ directory beside them is passed over), and every library must have:
 #   - the name lib<name>.so, and its file name as SONAME: Android packages only
 #     such files, and older Android versions find a library by file name;
 #   - no RUNPATH or RPATH: an app's libraries are found in its own directory;
@@ -14,16 +16,17 @@
 #     it all) and, for libreliqaclassifier.so, libkestrova_host.so: the
 #     dependencies and the C++ runtime are inside;
 #   - exported symbols of its own only: libreliqaclassifier.so exports exactly
-#     JNI_OnLoad and JNI_OnLoad_Weak, libkestrova_host.so its JNI_OnLoad and
-#     names in namespace kestrova (nothing of the runtime or the dependencies);
-#   - no test code (the failure-injecting store, the failing SQLite VFS), in
-#     the unstripped copy's symbol table;
+#     what its version script (reliqaclassifier/jni/exports.map) makes global,
+#     libkestrova_host.so its JNI_OnLoad and names in namespace kestrova
+#     (nothing of the runtime or the dependencies);
+#   - no test code (the failure-injecting store, the failing SQLite VFS) in
+#     the symbol table of its unstripped copy (DIR/symbols/, else BUILD/lib/);
 #   - LOAD segments aligned to at least 16 KB (phones with 16 KB pages);
 #   - no text relocations, a GNU_RELRO segment and BIND_NOW (full RELRO);
 #   - a build ID (crash reports are matched against the unstripped copies);
-#   - every symbol resolved when loaded with the libraries beside it (ldd -r
-#     for x86_64, the sysroot's loader under qemu for arm64 and armhf), and
-#     libkestrova_host.so taken from DIR, not from the machine.
+#   - every symbol resolved when loaded with the libraries beside it (ldd -r,
+#     or the ABI's loader under BUILD's emulator), and libkestrova_host.so
+#     taken from DIR, not from the machine.
 # Each violation is reported on standard error; the exit status is 1 if there
 # was any. The table goes to standard output.
 set -euo pipefail
@@ -47,7 +50,7 @@ fail() {  # fail <ABI>/<library> <what is wrong>
 targets=("$@")
 if [ ${#targets[@]} -eq 0 ]; then
   for abi in x86_64 arm64 armhf; do
-    [ -d "dist/$abi" ] && targets+=("$abi=dist/$abi")
+    [ -d "dist/$abi" ] && targets+=("build-$abi=dist/$abi")
   done
 fi
 if [ ${#targets[@]} -eq 0 ]; then
@@ -55,19 +58,23 @@ if [ ${#targets[@]} -eq 0 ]; then
   exit 1
 fi
 
+# What the classifier library's version script makes global.
+expected_exports=$(sed -n '/global:/,/local:/s/^[[:space:]]*\([A-Za-z_][A-Za-z0-9_]*\);.*/\1/p' \
+  reliqaclassifier/jni/exports.map | sort -u | tr '\n' ' ')
+
 # Loads <lib> with the libraries of its directory and prints what the loader
-# reports, the way ldd -r does. $sysroot is the ABI's sysroot (none for x86_64).
-load_report() {  # load_report <ABI> <library>
-  local abi=$1 lib=$2 dir
+# reports, the way ldd -r does: on this machine, or with the loader that
+# $build's programs use, under $build's emulator.
+load_report() {  # load_report <library>
+  local lib=$1 dir loader
   dir=$(dirname "$lib")
-  case "$abi" in
-    x86_64) LD_LIBRARY_PATH=$dir ldd -r "$lib" 2>&1 || true ;;
-    arm64 | armhf)
-      local qemu=qemu-aarch64-static loader=$sysroot/lib/ld-linux-aarch64.so.1
-      if [ "$abi" = armhf ]; then qemu=qemu-arm-static loader=$sysroot/lib/ld-linux-armhf.so.3; fi
-      LD_TRACE_LOADED_OBJECTS=1 LD_WARN=yes LD_BIND_NOW=yes \
-        "$qemu" -L "$sysroot" "$loader" --library-path "$dir" "$lib" 2>&1 || true ;;
-  esac
+  if [ ! -x "$build/emulator" ]; then
+    LD_LIBRARY_PATH=$dir ldd -r "$lib" 2>&1 || true
+    return
+  fi
+  loader=$(readelf -lW "$build/bin/reliqa" | sed -n 's/.*Requesting program interpreter: \(.*\)\]/\1/p')
+  LD_TRACE_LOADED_OBJECTS=1 LD_WARN=yes LD_BIND_NOW=yes \
+    "$build/emulator" "$loader" --library-path "$dir" "$lib" 2>&1 || true
 }
 
 # Defined global and weak dynamic symbols, demangled, without versions.
@@ -81,14 +88,13 @@ table="| ABI | Library | Stripped size (bytes) | DT_NEEDED |
 |---|---|---:|---|"
 totals=""
 for target in "${targets[@]}"; do
-  abi=${target%%=*} dir=${target#*=}
-  case "$abi" in
-    x86_64 | arm64 | armhf) ;;
-    *) echo "check-libs: unknown ABI '$abi' in '$target' (x86_64, arm64 or armhf)" >&2; exit 2 ;;
-  esac
+  build=${target%%=*}
+  dir=$build/stripped
+  [ "$target" = "$build" ] || dir=${target#*=}
+  abi=$(basename "$build")
+  abi=${abi#build-}
   [ -d "$dir" ] || { echo "check-libs: $dir is not a directory" >&2; exit 2; }
-  sysroot=""
-  [ "$abi" = x86_64 ] || sysroot=$(bash scripts/sysroot.sh "$abi")
+  [ -f "$build/bin/reliqa" ] || { echo "check-libs: $build is not a build of the shipped configuration" >&2; exit 2; }
 
   # Exactly the two libraries, each a lib<name>.so.
   libs=()
@@ -127,18 +133,18 @@ for target in "${targets[@]}"; do
 
     exported=$(exported_symbols "$lib")
     if [ "$name" = libreliqaclassifier.so ]; then
-      if [ "$(tr '\n' ' ' <<<"$exported")" != "JNI_OnLoad JNI_OnLoad_Weak " ]; then
-        fail "$where" "must export exactly JNI_OnLoad and JNI_OnLoad_Weak, but exports: $(tr '\n' ' ' <<<"$exported")"
+      if [ "$(tr '\n' ' ' <<<"$exported")" != "$expected_exports" ]; then
+        fail "$where" "must export exactly ${expected_exports}but exports: $(tr '\n' ' ' <<<"$exported")"
       fi
     else
       foreign=$(grep -vE '^(JNI_OnLoad|((typeinfo( name)?|vtable) for )?kestrova::.*)$' <<<"$exported" || true)
       [ -z "$foreign" ] || fail "$where" "exports what is not its own: $(head -5 <<<"$foreign" | tr '\n' ';')"
     fi
 
-    if [ -f "$dir/symbols/$name" ]; then
-      test_code=$(nm -C "$dir/symbols/$name" 2>/dev/null | grep -oE 'FaultInjectingKeyValueStore|FaultySqliteVfs' | sort -u || true)
-      [ -z "$test_code" ] || fail "$where" "contains test code: $(tr '\n' ' ' <<<"$test_code")"
-    fi
+    unstripped=$dir/symbols/$name
+    [ -f "$unstripped" ] || unstripped=$build/lib/$name
+    test_code=$(nm -C "$unstripped" 2>/dev/null | grep -oE 'FaultInjectingKeyValueStore|FaultySqliteVfs' | sort -u || true)
+    [ -z "$test_code" ] || fail "$where" "contains test code: $(tr '\n' ' ' <<<"$test_code")"
 
     # 16 KB pages: the alignment is the last column of each LOAD line.
     min_align=""
@@ -159,7 +165,7 @@ for target in "${targets[@]}"; do
     fi
     readelf -nW "$lib" | grep -q 'Build ID' || fail "$where" "has no build ID note"
 
-    report=$(load_report "$abi" "$lib")
+    report=$(load_report "$lib")
     if grep -q 'undefined symbol' <<<"$report"; then
       fail "$where" "has unresolved symbols: $(grep 'undefined symbol' <<<"$report" | head -5 | tr '\n' ';')"
     fi

@@ -1,25 +1,31 @@
 #!/usr/bin/env bash
-# Grows the fuzz corpora with a campaign:
-#   bash scripts/fuzz.sh [SECONDS] [TARGET...]
-# runs each fuzz target (all of them by default; names as in fuzz/, e.g.
-# fuzz_model_reader) for SECONDS (default 1800) of one core each, starting from
-# its committed corpus, then merges what the run found into
-# fuzz/corpus/<corpus>/: every committed input stays, and a new input is added
-# only when it reaches code that the corpus does not (libFuzzer -merge=1).
-# Commit the grown corpora; the test suite replays them (fuzz_replay_*).
-# Up to JOBS targets run at once (default: the number of cores). An input that
-# crashes, hangs or leaks is kept in fuzz/findings/<target>/ and the script
-# exits with status 1.
+# Runs the fuzz targets, one core each, starting from their committed corpora.
+#   bash scripts/fuzz.sh [SECONDS] [TARGET...]           a campaign (default 1800 s)
+#   bash scripts/fuzz.sh --check SECONDS [TARGET...]     the test command's run
+# A campaign merges what each run found into fuzz/corpus/<corpus>/: every
+# committed input stays, and a new input is added only when it reaches code
+# that the corpus does not (libFuzzer -merge=1); commit the grown corpora (the
+# test suite replays them: fuzz_replay_*). An input that crashes, hangs or
+# leaks is kept in fuzz/findings/<target>/, and the script exits with status 1.
+# --check leaves the corpora alone and keeps findings in a temporary directory
+# that it names. Targets are named as in fuzz/ (e.g. fuzz_model_reader), all
+# of them by default; up to JOBS run at once (default: the number of cores).
 set -euo pipefail
 cd "$(dirname "$0")/.."
-RUN_SECONDS=${1:-1800}
+CHECK=no
+if [ "${1:-}" = --check ]; then
+  CHECK=yes
+  shift
+  RUN_SECONDS=${1:?usage: $0 --check SECONDS [TARGET...]}
+else
+  RUN_SECONDS=${1:-1800}
+fi
 [ $# -gt 0 ] && shift
 JOBS=${JOBS:-$(nproc)}
 
 bash scripts/setup.sh
-cmake -S . -B build-fuzz -G Ninja -Wno-dev -DCMAKE_C_COMPILER=clang -DCMAKE_CXX_COMPILER=clang++ \
-  -DRELIQA_FUZZ=ON -DRELIQA_BENCH=OFF -DRELIQA_WERROR=ON -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
-cmake --build build-fuzz -j "$JOBS" --target fuzz_targets
+cmake --preset fuzz >/dev/null
+cmake --build --preset fuzz -j "$JOBS"
 
 targets=("$@")
 if [ ${#targets[@]} -eq 0 ]; then
@@ -27,21 +33,29 @@ if [ ${#targets[@]} -eq 0 ]; then
 fi
 
 logs=$(mktemp -d)
-campaign() {  # campaign <target>: run, then merge into the committed corpus
-  local name=$1 corpus="fuzz/corpus/${1#fuzz_}" work merged findings="fuzz/findings/$1"
+findings_root=fuzz/findings
+[ "$CHECK" = yes ] && findings_root=$logs/findings
+campaign() {  # campaign <target>: run, then (unless checking) merge into the committed corpus
+  local name=$1 corpus="fuzz/corpus/${1#fuzz_}" work merged findings="$findings_root/$1"
   work=$(mktemp -d)
-  merged=$(mktemp -d)
   mkdir -p "$findings"
   local before start status=0
   before=$(find "$corpus" -type f | wc -l)
   start=$(date +%s)
+  # A check runs on a copy of the corpus, which it may grow and drop.
+  local inputs=("$work" "$corpus")
+  [ "$CHECK" = yes ] && { cp -r "$corpus"/. "$work"/; inputs=("$work"); }
   "build-fuzz/bin/$name" -max_total_time="$RUN_SECONDS" -timeout=10 -rss_limit_mb=2048 \
-    -artifact_prefix="$findings/" -print_final_stats=1 "$work" "$corpus" >"$logs/$name.log" 2>&1 || status=$?
-  cp -r "$corpus"/. "$merged"/
-  "build-fuzz/bin/$name" -merge=1 -timeout=10 -rss_limit_mb=2048 "$merged" "$work" >>"$logs/$name.log" 2>&1 ||
-    status=$?
-  rm -rf "$corpus" && mkdir -p "$corpus" && cp -r "$merged"/. "$corpus"/
-  rm -rf "$work" "$merged"
+    -artifact_prefix="$findings/" -print_final_stats=1 "${inputs[@]}" >"$logs/$name.log" 2>&1 || status=$?
+  if [ "$CHECK" = no ]; then
+    merged=$(mktemp -d)
+    cp -r "$corpus"/. "$merged"/
+    "build-fuzz/bin/$name" -merge=1 -timeout=10 -rss_limit_mb=2048 "$merged" "$work" >>"$logs/$name.log" 2>&1 ||
+      status=$?
+    rm -rf "$corpus" && mkdir -p "$corpus" && cp -r "$merged"/. "$corpus"/
+    rm -rf "$merged"
+  fi
+  rm -rf "$work"
   rmdir "$findings" 2>/dev/null || true
   local runs
   runs=$(sed -n 's/^stat::number_of_executed_units: *//p' "$logs/$name.log" | tail -n 1)

@@ -4,7 +4,7 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 bash scripts/setup.sh
-cmake -S . -B build -G Ninja -Wno-dev >/dev/null
-cmake --build build --target reliqa
+cmake --preset plain >/dev/null
+cmake --build --preset plain --target reliqa
 build/bin/reliqa set-model --model examples/model.txt --model-id example-synthetic-v1 --threshold 0.5
 build/bin/reliqa classify examples/collection.json

@@ -11,20 +11,20 @@
 #                         libraries of x86_64, arm64-v8a and armeabi-v7a
 # Usage: scripts/package.sh
 # It packages the shipped builds of scripts/build-abi.sh: build-x86_64/,
-# build-arm64/ and build-armhf/, all three (the archive holds every ABI).
-# scripts/check-libs.sh checks the result.
+# build-arm64/ and build-armhf/, all three (the archive holds every ABI); each
+# has the stripped libraries in stripped/ and the unstripped ones in lib/.
+# Each build's tests check its libraries; scripts/check-libs.sh checks dist/.
 set -euo pipefail
 cd "$(dirname "$0")/.."
-
-STRIP=$(command -v llvm-strip-14 || command -v llvm-strip || true)
-[ -n "$STRIP" ] || { echo "package: llvm-strip not found (run scripts/setup.sh)" >&2; exit 1; }
 
 LIBRARIES=(libreliqaclassifier.so libkestrova_host.so)
 ABIS=(x86_64 arm64 armhf)
 missing=()
 for abi in "${ABIS[@]}"; do
   for name in "${LIBRARIES[@]}"; do
-    [ -f "build-$abi/lib/$name" ] || missing+=("build-$abi/lib/$name")
+    for f in "build-$abi/lib/$name" "build-$abi/stripped/$name"; do
+      [ -f "$f" ] || missing+=("$f")
+    done
   done
 done
 if [ ${#missing[@]} -gt 0 ]; then
@@ -40,7 +40,7 @@ for abi in "${ABIS[@]}"; do
   mkdir -p "dist/$abi/symbols"
   for name in "${LIBRARIES[@]}"; do
     cp "build-$abi/lib/$name" "dist/$abi/symbols/$name"
-    "$STRIP" --strip-all -o "dist/$abi/$name" "dist/$abi/symbols/$name"
+    cp "build-$abi/stripped/$name" "dist/$abi/$name"
   done
 done
 /usr/bin/python3 scripts/aar.py write dist/reliqa.aar --classes dist/reliqa.jar \

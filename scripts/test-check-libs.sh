@@ -1,13 +1,16 @@
 #!/usr/bin/env bash
-# Plants one fault at a time in a copy of dist/x86_64 and requires
-# scripts/check-libs.sh to fail on it with the message of the rule it breaks:
-# a checker that passes everything would pass dist/ too.
-#   scripts/test-check-libs.sh        (after scripts/package.sh)
+# Plants one fault at a time in a copy of a build's stripped libraries and
+# requires scripts/check-libs.sh to fail on it with the message of the rule it
+# breaks: a checker that passes everything would pass what ships too.
+#   scripts/test-check-libs.sh BUILD   (the x86_64 shipped build; its test
+#                                       shipped_libraries_faults runs this)
 # The faulty libraries are small stand-ins for libkestrova_host.so, linked
 # like the real ones except for the one fault.
 set -euo pipefail
 cd "$(dirname "$0")/.."
-[ -f dist/x86_64/libreliqaclassifier.so ] || { echo "test-check-libs: run scripts/package.sh first" >&2; exit 1; }
+BUILD=${1:?usage: $0 BUILD}
+base=$BUILD/stripped
+[ -f "$base/libreliqaclassifier.so" ] || { echo "test-check-libs: $base holds no libraries; build $BUILD first" >&2; exit 1; }
 
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
@@ -30,10 +33,10 @@ failures=0
 expect() {
   local fault=$1 message=$2 dir=$work/case
   shift 2
-  rm -rf "$dir" && mkdir -p "$dir" && cp -r dist/x86_64/. "$dir/"
+  rm -rf "$dir" && mkdir -p "$dir/symbols" && cp -r "$base"/. "$dir/"
   "$@"
   local output status=0
-  output=$(bash scripts/check-libs.sh "x86_64=$dir" 2>&1 >/dev/null) || status=$?
+  output=$(bash scripts/check-libs.sh "$BUILD=$dir" 2>&1 >/dev/null) || status=$?
   if [ "$status" -ne 0 ] && grep -qF -- "$message" <<<"$output"; then
     echo "ok: $fault"
   else
@@ -45,9 +48,9 @@ expect() {
 
 dir=$work/case
 expect "a versioned file name" "libfoo.so.1: is not named lib<name>.so" \
-  cp dist/x86_64/libkestrova_host.so "$dir/libfoo.so.1"
+  cp "$base/libkestrova_host.so" "$dir/libfoo.so.1"
 expect "a third library" "libsqlite3.so: is shipped, but only" \
-  cp dist/x86_64/libkestrova_host.so "$dir/libsqlite3.so"
+  cp "$base/libkestrova_host.so" "$dir/libsqlite3.so"
 expect "a SONAME other than the file name" "has SONAME 'libkestrova_host.so.1', not its file name" \
   stand_in "$dir/libkestrova_host.so" -Wl,-soname,libkestrova_host.so.1
 expect "a run path" "has a RUNPATH ('\$ORIGIN')" \

@@ -1,21 +1,21 @@
 #!/usr/bin/env bash
 # The JVM tests of the JNI libraries: runs the JUnit 5 suite of
 # BUILD/java/reliqa-tests.jar in a JVM with -Xcheck:jni and fails on any JNI
-# warning the JVM prints.
-#   scripts/test-java.sh BUILD [LIBDIR]
-# BUILD is a build directory (build/, or build-<ABI>/ of scripts/build-abi.sh);
-# its lib/ gives the tests' own native library. LIBDIR holds the
-# libreliqaclassifier.so and libkestrova_host.so under test (default:
-# BUILD/lib; dist/<ABI> tests what ships). A cross build's tests run in the
-# Java runtime of its sysroot, under the emulator.
+# warning the JVM prints. Registered as the test jvm_suite of every build
+# that makes the jars (java/CMakeLists.txt), which passes its arguments:
+#   scripts/test-java.sh BUILD LIBDIR JUNIT_CONSOLE_JAR
+# BUILD is a build directory; its lib/ gives the tests' own native library.
+# LIBDIR holds the libreliqaclassifier.so and libkestrova_host.so under test
+# (BUILD/stripped: what ships). A cross build's tests run in the Java runtime
+# of its sysroot, under the emulator.
 set -euo pipefail
 cd "$(dirname "$0")/.."
-BUILD=${1:?usage: $0 BUILD [LIBDIR]}
-LIBDIR=${2:-$BUILD/lib}
+BUILD=${1:?usage: $0 BUILD LIBDIR JUNIT_CONSOLE_JAR}
+LIBDIR=${2:?usage: $0 BUILD LIBDIR JUNIT_CONSOLE_JAR}
+JUNIT=${3:?usage: $0 BUILD LIBDIR JUNIT_CONSOLE_JAR}
 JAR=$BUILD/java/reliqa.jar
 TESTS=$BUILD/java/reliqa-tests.jar
 SUPPORT=$BUILD/lib/libreliqa_jni_testsupport.so
-JUNIT=/usr/share/java/junit-platform-console-standalone.jar
 
 for f in "$LIBDIR/libreliqaclassifier.so" "$LIBDIR/libkestrova_host.so" "$SUPPORT" "$JAR" "$TESTS" "$JUNIT"; do
   [ -e "$f" ] || { echo "test-java: missing $f (build $BUILD first)" >&2; exit 1; }
