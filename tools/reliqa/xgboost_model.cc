@@ -1,14 +1,20 @@
 #include "tools/reliqa/xgboost_model.h"
 
-#include <cerrno>
+#include <double-conversion/double-conversion.h>
+
+#include <algorithm>
+#include <charconv>
+#include <climits>
 #include <cmath>
 #include <cstdlib>
 #include <limits>
+#include <optional>
 #include <set>
+#include <system_error>
 
 #include "tools/reliqa/errors.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "tools/reliqa/json_doc.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 
 namespace reliqa::tool {
 
@@ -46,16 +52,35 @@ void forEachElement(JsonDoc& doc, array arr, const std::string& path, F&& onElem
   }
 }
 
+// A float as C's strtof reads a whole text in the "C" locale: white space, an
+// optional sign, then decimal or hexadecimal ("0x1p-1") digits with an
+// optional exponent, correctly rounded to a float (not through a double), and
+// nothing after them. A value beyond the float range reads as an infinity; the
+// words inf and nan are not numbers here.
+std::optional<float> textToFloat(std::string_view text) {
+  using double_conversion::StringToDoubleConverter;
+  static const StringToDoubleConverter converter(
+      StringToDoubleConverter::ALLOW_LEADING_SPACES | StringToDoubleConverter::ALLOW_HEX |
+          StringToDoubleConverter::ALLOW_HEX_FLOATS,
+      std::numeric_limits<double>::quiet_NaN(), std::numeric_limits<double>::quiet_NaN(), nullptr, nullptr);
+  // Longer texts than the converter takes are never numbers.
+  if (text.size() > static_cast<size_t>(INT_MAX)) return std::nullopt;
+  int used = 0;
+  const float f = converter.StringToFloat(text.data(), static_cast<int>(text.size()), &used);
+  if (std::isnan(f) || static_cast<size_t>(used) != text.size()) return std::nullopt;
+  return f;
+}
+
 // A float exactly as XGBoost wrote it (parsed as float, not via double). A
 // number beyond the float range is refused; one below it keeps its rounded
 // value (XGBoost writes subnormal floats).
 float readFloat(JsonDoc& doc, value& v, const std::string& path) {
   doc.getDouble(v, path);  // type and syntax check
   const std::string token(JsonDoc::tokenOf(v));
-  errno = 0;
-  float f = std::strtof(token.c_str(), nullptr);
-  if (errno == ERANGE && std::isinf(f)) doc.fail(v, path + ": " + token + " is outside the range of a float");
-  return f;
+  std::optional<float> f = textToFloat(token);
+  if (!f) doc.fail(v, path + ": malformed number " + quoteForMessage(token));
+  if (std::isinf(*f)) doc.fail(v, path + ": " + token + " is outside the range of a float");
+  return *f;
 }
 
 // XGBoost writes its scalar parameters as strings ("74", "5E-1"); newer
@@ -67,13 +92,24 @@ std::string paramText(JsonDoc& doc, value& v, const std::string& path) {
   return doc.getString(v, path);
 }
 
+// An integer parameter: C white space, an optional sign and decimal digits,
+// then only JSON white space. The text ends at a zero byte; a non-empty text
+// without digits reads as 0 when it holds nothing but JSON white space.
 int64_t paramInt(JsonDoc& doc, value& v, const std::string& path) {
-  std::string text = paramText(doc, v, path);
-  char* end = nullptr;
-  errno = 0;
-  long long x = std::strtoll(text.c_str(), &end, 10);
-  while (end && (*end == ' ' || *end == '\n' || *end == '\t' || *end == '\r')) ++end;
-  if (text.empty() || errno != 0 || *end != '\0') {
+  const std::string text = paramText(doc, v, path);
+  std::string_view rest = std::string_view(text).substr(0, text.find('\0'));
+  const size_t start = std::min(rest.find_first_not_of(" \t\n\v\f\r"), rest.size());
+  const size_t digits = start + (start < rest.size() && (rest[start] == '+' || rest[start] == '-') ? 1 : 0);
+  int64_t x = 0;
+  bool inRange = true;
+  if (digits < rest.size() && rest[digits] >= '0' && rest[digits] <= '9') {
+    // from_chars takes a leading '-' but not a '+'.
+    const char* first = rest.data() + (rest[start] == '+' ? digits : start);
+    const auto [end, error] = std::from_chars(first, rest.data() + rest.size(), x);
+    inRange = error == std::errc();
+    rest.remove_prefix(static_cast<size_t>(end - rest.data()));
+  }
+  if (text.empty() || !inRange || rest.find_first_not_of(" \t\n\r") != std::string_view::npos) {
     doc.fail(v, path + ": expected an integer, got " + quoteForMessage(text));
   }
   return x;
@@ -246,11 +282,12 @@ class XgbReader {
         doc_.fail(v, path + ": one base score per output; multi-output models cannot be converted");
       }
     }
-    char* end = nullptr;
-    m_.baseScore = std::strtof(baseScoreText_.c_str(), &end);
-    if (baseScoreText_.empty() || *end != '\0') {
+    // The text ends at a zero byte.
+    std::optional<float> score = textToFloat(std::string_view(baseScoreText_).substr(0, baseScoreText_.find('\0')));
+    if (baseScoreText_.empty() || !score) {
       doc_.fail(v, path + ": expected a number, got " + quoteForMessage(baseScoreText_));
     }
+    m_.baseScore = *score;
   }
 
   void readBooster(value& v, const std::string& path) {
@@ -359,17 +396,17 @@ std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64
                       "with --feature-ids 1,2,... (" + std::to_string(model.numFeature) + " ids)");
     }
     for (const std::string& n : model.featureNames) {
-      bool integer = !n.empty() && n.size() <= 11;
-      for (size_t i = 0; i < n.size() && integer; ++i) {
-        integer = (n[i] >= '0' && n[i] <= '9') || (i == 0 && n[i] == '-' && n.size() > 1);
-      }
-      if (!integer) {
+      // As long as the longest 32-bit id ("-2147483648") at most; the range
+      // is checked below.
+      int64_t id = 0;
+      const auto [end, error] = std::from_chars(n.data(), n.data() + n.size(), id);
+      if (error != std::errc() || end != n.data() + n.size() || n.size() > 11) {
         throw ToolError(name, 0,
                         "feature name " + quoteForMessage(n) +
                             " is not an integer feature id; give one id per feature with --feature-ids 1,2,... (" +
                             std::to_string(model.numFeature) + " ids, in the order of the model's features)");
       }
-      ids.push_back(std::strtoll(n.c_str(), nullptr, 10));
+      ids.push_back(id);
     }
   } else if (static_cast<int64_t>(ids.size()) != model.numFeature) {
     throw UsageError("--feature-ids gives " + std::to_string(ids.size()) + " ids but the model has " +
