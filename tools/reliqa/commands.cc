@@ -277,7 +277,7 @@ void pdp(const PdpOptions& o, ResultWriter& out) {
 
 void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
   std::string name = displayName(o.input);
-  std::vector<int64_t> given = o.featureIds.empty() ? std::vector<int64_t>{} : parseIdList(o.featureIds);
+  std::vector<int64_t> given = parseIdList(o.featureIds);
   if (o.input.size() > 4 && o.input.compare(o.input.size() - 4, 4, ".ubj") == 0) {
     throw ToolError(name, 0, "binary (UBJSON) models cannot be read; save the model as JSON: save_model(\"model.json\")");
   }

@@ -6,7 +6,6 @@
 #include <charconv>
 #include <climits>
 #include <cmath>
-#include <cstdlib>
 #include <limits>
 #include <optional>
 #include <set>
@@ -366,25 +365,24 @@ XgbModel readXgboostModel(std::string_view json, const std::string& name) {
   return XgbReader(doc).read();
 }
 
-std::vector<int64_t> parseIdList(const std::string& text) {
-  std::vector<int64_t> out;
-  size_t i = 0;
-  while (true) {
-    while (i < text.size() && text[i] == ' ') ++i;
-    size_t start = i;
-    if (i < text.size() && (text[i] == '-' || text[i] == '+')) ++i;
-    size_t digits = i;
-    while (i < text.size() && text[i] >= '0' && text[i] <= '9') ++i;
-    if (i == digits || i - digits > 18) {
-      throw UsageError("--feature-ids: expected comma-separated integers, got " + quoteForMessage(text));
+std::vector<int64_t> parseIdList(const std::vector<std::string>& items) {
+  std::vector<int64_t> ids;
+  for (const std::string& item : items) {
+    if (item.empty()) continue;
+    const size_t first = item.find_first_not_of(' ');
+    std::string_view text;
+    if (first != std::string::npos) text = std::string_view(item).substr(first, item.find_last_not_of(' ') + 1 - first);
+    // from_chars takes a leading '-' but not a '+'.
+    if (text.size() > 1 && text[0] == '+' && text[1] >= '0' && text[1] <= '9') text.remove_prefix(1);
+    const size_t digits = text.size() - (!text.empty() && text[0] == '-' ? 1 : 0);
+    int64_t id = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), id);
+    if (error != std::errc() || end != text.data() + text.size() || digits > 18) {
+      throw UsageError("--feature-ids: expected comma-separated integers, got " + quoteForMessage(item));
     }
-    out.push_back(std::strtoll(text.substr(start, i - start).c_str(), nullptr, 10));
-    while (i < text.size() && text[i] == ' ') ++i;
-    if (i == text.size()) break;
-    if (text[i] != ',') throw UsageError("--feature-ids: expected comma-separated integers, got " + quoteForMessage(text));
-    ++i;
+    ids.push_back(id);
   }
-  return out;
+  return ids;
 }
 
 std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64_t>& given, const std::string& name) {

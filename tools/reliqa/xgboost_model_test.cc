@@ -94,9 +94,16 @@ TEST(XgboostModel, FeatureIdsComeFromNamesOrTheCommandLine) {
   EXPECT_THAT(errorOf(model(kTree0, R"(["1","2","1"])")), HasSubstr("feature id 1 is given twice"));
   EXPECT_THAT(errorOf(model(kTree0), {1, 2}), HasSubstr("gives 2 ids but the model has 3 features"));
   EXPECT_THAT(errorOf(model(kTree0), {1, 2, 4294967296}), HasSubstr("not a 32-bit integer"));
-  EXPECT_EQ(parseIdList(" 1, 2,-3"), (std::vector<int64_t>{1, 2, -3}));
-  EXPECT_THROW(parseIdList("1,,2"), UsageError);
-  EXPECT_THROW(parseIdList("1;2"), UsageError);
+}
+
+TEST(XgboostModel, FeatureIdItemsAreDecimalIntegers) {
+  // Items as CLI11 hands them over after splitting at commas.
+  EXPECT_EQ(parseIdList({" 1", " 2 ", "-3", "+4", "010", "", "-123456789012345678"}),
+            (std::vector<int64_t>{1, 2, -3, 4, 10, -123456789012345678}));
+  EXPECT_TRUE(parseIdList({""}).empty());
+  for (const char* bad : {"1;2", " ", "+", "-", "+-5", "1 2", "\t1", "0x10", "1e3", "1234567890123456789"}) {
+    EXPECT_THROW(parseIdList({"1", bad}), UsageError) << bad;
+  }
 }
 
 TEST(XgboostModel, ReadsParametersAsXgboostWritesThem) {
