@@ -91,27 +91,33 @@ std::string paramText(JsonDoc& doc, value& v, const std::string& path) {
   return doc.getString(v, path);
 }
 
+// The whole text as a decimal int64 with an optional '+' or '-'; none when it
+// is anything else or out of range.
+std::optional<int64_t> wholeDecimal(std::string_view text) {
+  // from_chars itself takes a '-' only.
+  if (text.size() > 1 && text[0] == '+' && text[1] >= '0' && text[1] <= '9') text.remove_prefix(1);
+  int64_t value = 0;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
+  if (error != std::errc() || end != text.data() + text.size()) return std::nullopt;
+  return value;
+}
+
 // An integer parameter: C white space, an optional sign and decimal digits,
 // then only JSON white space. The text ends at a zero byte; a non-empty text
-// without digits reads as 0 when it holds nothing but JSON white space.
+// of JSON white space alone reads as 0.
 int64_t paramInt(JsonDoc& doc, value& v, const std::string& path) {
   const std::string text = paramText(doc, v, path);
-  std::string_view rest = std::string_view(text).substr(0, text.find('\0'));
-  const size_t start = std::min(rest.find_first_not_of(" \t\n\v\f\r"), rest.size());
-  const size_t digits = start + (start < rest.size() && (rest[start] == '+' || rest[start] == '-') ? 1 : 0);
-  int64_t x = 0;
-  bool inRange = true;
-  if (digits < rest.size() && rest[digits] >= '0' && rest[digits] <= '9') {
-    // from_chars takes a leading '-' but not a '+'.
-    const char* first = rest.data() + (rest[start] == '+' ? digits : start);
-    const auto [end, error] = std::from_chars(first, rest.data() + rest.size(), x);
-    inRange = error == std::errc();
-    rest.remove_prefix(static_cast<size_t>(end - rest.data()));
+  std::string_view number = std::string_view(text).substr(0, text.find('\0'));
+  std::optional<int64_t> x;
+  if (number.find_first_not_of(" \t\n\r") == std::string_view::npos) {
+    if (!text.empty()) x = 0;
+  } else {
+    const size_t end = number.find_last_not_of(" \t\n\r") + 1;
+    const size_t start = std::min(number.find_first_not_of(" \t\n\v\f\r"), end);
+    x = wholeDecimal(number.substr(start, end - start));
   }
-  if (text.empty() || !inRange || rest.find_first_not_of(" \t\n\r") != std::string_view::npos) {
-    doc.fail(v, path + ": expected an integer, got " + quoteForMessage(text));
-  }
-  return x;
+  if (!x) doc.fail(v, path + ": expected an integer, got " + quoteForMessage(text));
+  return *x;
 }
 
 std::vector<int32_t> readInts(JsonDoc& doc, value& v, const std::string& path) {
@@ -369,18 +375,15 @@ std::vector<int64_t> parseIdList(const std::vector<std::string>& items) {
   std::vector<int64_t> ids;
   for (const std::string& item : items) {
     if (item.empty()) continue;
-    const size_t first = item.find_first_not_of(' ');
-    std::string_view text;
-    if (first != std::string::npos) text = std::string_view(item).substr(first, item.find_last_not_of(' ') + 1 - first);
-    // from_chars takes a leading '-' but not a '+'.
-    if (text.size() > 1 && text[0] == '+' && text[1] >= '0' && text[1] <= '9') text.remove_prefix(1);
-    const size_t digits = text.size() - (!text.empty() && text[0] == '-' ? 1 : 0);
-    int64_t id = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), id);
-    if (error != std::errc() || end != text.data() + text.size() || digits > 18) {
+    const size_t end = item.find_last_not_of(' ') + 1;  // 0 for spaces alone
+    const size_t start = std::min(item.find_first_not_of(' '), end);
+    const std::string_view text = std::string_view(item).substr(start, end - start);
+    const size_t digits = text.size() - (!text.empty() && (text[0] == '-' || text[0] == '+') ? 1 : 0);
+    std::optional<int64_t> id = wholeDecimal(text);
+    if (!id || digits > 18) {
       throw UsageError("--feature-ids: expected comma-separated integers, got " + quoteForMessage(item));
     }
-    ids.push_back(id);
+    ids.push_back(*id);
   }
   return ids;
 }
