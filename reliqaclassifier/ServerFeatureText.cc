@@ -3,7 +3,10 @@
 #include <locale.h>
 #include <stdlib.h>
 
+#include <charconv>
+#include <cstdint>
 #include <limits>
+#include <system_error>
 
 namespace kestrova::reliqaclassifier {
 namespace {
@@ -30,20 +33,18 @@ std::optional<int32_t> parseFeatureId(std::string_view text) {
     negative = text[i] == '-';
     ++i;
   }
-  // Large enough for |INT32_MIN|; anything beyond it is out of range.
-  constexpr int64_t kLimit = int64_t{std::numeric_limits<int32_t>::max()} + 1;
-  int64_t magnitude = 0;
-  for (; i < text.size() && text[i] >= '0' && text[i] <= '9'; ++i) {
-    magnitude = magnitude * 10 + (text[i] - '0');
-    if (magnitude > kLimit) {
-      return std::nullopt;
-    }
+  // The digits are read as an unsigned magnitude: a second sign is not a
+  // digit, and text without digits reads as 0.
+  uint64_t magnitude = 0;
+  const std::errc error = std::from_chars(text.data() + i, text.data() + text.size(), magnitude).ec;
+  if (error == std::errc::invalid_argument) {
+    return 0;
   }
-  int64_t value = negative ? -magnitude : magnitude;
-  if (value > std::numeric_limits<int32_t>::max()) {
+  const uint64_t limit = uint64_t{std::numeric_limits<int32_t>::max()} + (negative ? 1 : 0);
+  if (error == std::errc::result_out_of_range || magnitude > limit) {
     return std::nullopt;
   }
-  return static_cast<int32_t>(value);
+  return static_cast<int32_t>(negative ? -static_cast<int64_t>(magnitude) : static_cast<int64_t>(magnitude));
 }
 
 double parseFeatureValue(const std::string& text) {

@@ -16,6 +16,9 @@ TEST(ParseFeatureId, ReadsLikeAtoi) {
   EXPECT_EQ(parseFeatureId("abc"), 0);
   EXPECT_EQ(parseFeatureId(""), 0);
   EXPECT_EQ(parseFeatureId("-"), 0);
+  EXPECT_EQ(parseFeatureId("+-5"), 0);  // one sign only
+  EXPECT_EQ(parseFeatureId("-+5"), 0);
+  EXPECT_EQ(parseFeatureId("\v\f\r-0"), 0);
   EXPECT_EQ(parseFeatureId("1 2"), 1);
   EXPECT_EQ(parseFeatureId(std::string_view("3\0" "9", 3)), 3);
 }
@@ -23,7 +26,10 @@ TEST(ParseFeatureId, ReadsLikeAtoi) {
 TEST(ParseFeatureId, RejectsIdsOutsideTheSigned32BitRange) {
   EXPECT_EQ(parseFeatureId("2147483647"), 2147483647);
   EXPECT_EQ(parseFeatureId("-2147483648"), -2147483647 - 1);
+  EXPECT_EQ(parseFeatureId("+2147483647"), 2147483647);
+  EXPECT_EQ(parseFeatureId("-000000000002147483648"), -2147483647 - 1);
   EXPECT_EQ(parseFeatureId("2147483648"), std::nullopt);
+  EXPECT_EQ(parseFeatureId("+2147483648"), std::nullopt);
   EXPECT_EQ(parseFeatureId("-2147483649"), std::nullopt);
   EXPECT_EQ(parseFeatureId("99999999999999999999999999"), std::nullopt);  // no wrap-around
   EXPECT_EQ(parseFeatureId("0000000000002147483647x"), 2147483647);

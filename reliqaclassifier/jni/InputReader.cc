@@ -17,7 +17,13 @@ namespace {
 
 using jni::LocalRef;
 
-#define RELIQA_TYPE(name) "Lcom/kestrova/sharefold/reliqaclassifier/models/" name ";"
+// Types of the fields that hold the input's nested objects.
+constexpr auto kLocationInfoType = managed::typeOf(managed::kLocationInfo);
+constexpr auto kAssetCountsType = managed::typeOf(managed::kAssetCounts);
+constexpr auto kAssetDetailArrayType = managed::join("[", managed::typeOf(managed::kAssetDetail));
+constexpr auto kDuplicateInfoArrayType =
+    managed::join("[", managed::typeOf(managed::kDuplicateInfo));
+constexpr auto kOptionalImageMetricValueType = managed::typeOf(managed::kOptionalImageMetricValue);
 
 struct InputFields {
   jfieldID collectionID, timeSinceStory, locationInfo, assetCounts, assetDetails, duplicateInfos;
@@ -28,11 +34,10 @@ struct InputFields {
       InputFields f;
       f.collectionID = jni::getFieldId(cls.get(), "collectionID", managed::kStringType);
       f.timeSinceStory = jni::getFieldId(cls.get(), "timeSinceStory", "D");
-      f.locationInfo = jni::getFieldId(cls.get(), "locationInfo", RELIQA_TYPE("LocationInfo"));
-      f.assetCounts = jni::getFieldId(cls.get(), "assetCounts", RELIQA_TYPE("AssetCounts"));
-      f.assetDetails = jni::getFieldId(cls.get(), "assetDetails", "[" RELIQA_TYPE("AssetDetail"));
-      f.duplicateInfos =
-          jni::getFieldId(cls.get(), "duplicateInfos", "[" RELIQA_TYPE("DuplicateInfo"));
+      f.locationInfo = jni::getFieldId(cls.get(), "locationInfo", kLocationInfoType);
+      f.assetCounts = jni::getFieldId(cls.get(), "assetCounts", kAssetCountsType);
+      f.assetDetails = jni::getFieldId(cls.get(), "assetDetails", kAssetDetailArrayType);
+      f.duplicateInfos = jni::getFieldId(cls.get(), "duplicateInfos", kDuplicateInfoArrayType);
       return f;
     }();
     return fields;
@@ -106,8 +111,8 @@ struct AssetDetailFields {
       f.isHidden = field("isHidden", "I");
       f.mediaSubtypes = field("mediaSubtypes", "I");
       f.sourceType = field("sourceType", "I");
-      f.blurrinessMetric = field("blurrinessMetric", RELIQA_TYPE("OptionalImageMetricValue"));
-      f.darknessMetric = field("darknessMetric", RELIQA_TYPE("OptionalImageMetricValue"));
+      f.blurrinessMetric = field("blurrinessMetric", kOptionalImageMetricValueType);
+      f.darknessMetric = field("darknessMetric", kOptionalImageMetricValueType);
       return f;
     }();
     return fields;
@@ -144,8 +149,6 @@ struct DuplicateInfoFields {
     return fields;
   }
 };
-
-#undef RELIQA_TYPE
 
 std::string readString(JNIEnv* env, jobject object, jfieldID field, const ObjectPath& path,
                        const char* name) {

@@ -81,26 +81,23 @@ ReliqaClassifierHybrid::ReliqaClassifierHybrid(const PersistentKeyValueStoreHybr
 ReliqaClassifierHybrid::~ReliqaClassifierHybrid() = default;
 
 void ReliqaClassifierHybrid::registerNatives() {
+  using managed::join;
+  using managed::typeOf;
+  static constexpr auto kInitHybrid = join("(", managed::kStoreType, ")", managed::kHybridDataType);
+  static constexpr auto kSetModelParams = join("(", typeOf(managed::kModelParams), ")V");
+  static constexpr auto kSetServerFeatures = join("(", typeOf(managed::kServerFeatures), ")V");
+  static constexpr auto kClassifyReliqa =
+      join("(", typeOf(managed::kInput), ")", typeOf(managed::kResultWrapper));
   static const JNINativeMethod methods[] = {
-      {const_cast<char*>("initHybrid"),
-       const_cast<char*>(
-           "(Lcom/kestrova/keystash/PersistentKeyValueStore;)Lcom/kestrova/jni/HybridData;"),
+      {const_cast<char*>("initHybrid"), const_cast<char*>(kInitHybrid.text),
        reinterpret_cast<void*>(&initHybrid)},
       {const_cast<char*>("currentlyUsedModelId"), const_cast<char*>("()[B"),
        reinterpret_cast<void*>(&currentlyUsedModelId)},
-      {const_cast<char*>("setModelParams"),
-       const_cast<char*>(
-           "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierModelParams;)V"),
+      {const_cast<char*>("setModelParams"), const_cast<char*>(kSetModelParams.text),
        reinterpret_cast<void*>(&setModelParams)},
-      {const_cast<char*>("setServerFeatures"),
-       const_cast<char*>(
-           "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierServerFeatures;)V"),
+      {const_cast<char*>("setServerFeatures"), const_cast<char*>(kSetServerFeatures.text),
        reinterpret_cast<void*>(&setServerFeatures)},
-      {const_cast<char*>("classifyReliqa"),
-       const_cast<char*>(
-           "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;)"
-           "Lcom/kestrova/sharefold/reliqaclassifier/models/"
-           "ReliqaClassifierResult$ReliqaClassifierResultWrapper;"),
+      {const_cast<char*>("classifyReliqa"), const_cast<char*>(kClassifyReliqa.text),
        reinterpret_cast<void*>(&classifyReliqa)},
   };
   JNIEnv* env = jni::Environment::current();

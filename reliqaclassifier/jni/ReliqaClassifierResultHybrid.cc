@@ -102,7 +102,8 @@ jni::LocalRef<jobject> ReliqaClassifierResultHybrid::newWrapper(ReliqaClassifier
     return wrapper;
   }
 
-  static const jmethodID constructor = jni::getMethodId(cls, "<init>", "(Lcom/kestrova/jni/HybridData;)V");
+  static constexpr auto kConstructor = managed::join("(", managed::kHybridDataType, ")V");
+  static const jmethodID constructor = jni::getMethodId(cls, "<init>", kConstructor);
   jni::LocalRef<jobject> hybridData = jni::detail::HybridData::create();
   attachPeer(jni::detail::HybridData::getDestructor(hybridData.get()).get(), std::move(peer));
   jni::LocalRef<jobject> wrapper(env->NewObject(cls, constructor, hybridData.get()));

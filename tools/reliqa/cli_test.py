@@ -165,6 +165,20 @@ class BadInput(Tool):
         self.assertRegex(out.stderr, r"reliqa: .*inf\.json:1: classification failed: .*INF")
 
 
+class Conversion(Tool):
+    def test_feature_ids_name_the_features_of_an_unnamed_model(self):
+        tree = {"left_children": [1, -1, -1], "right_children": [2, -1, -1], "split_indices": [1, 0, 0],
+                "split_conditions": [0.5, -0.25, 0.75], "split_type": [0, 0, 0], "tree_param": {"num_nodes": "3"}}
+        m = {"learner": {"feature_names": [], "objective": {"name": "binary:logistic"},
+                         "learner_model_param": {"base_score": "5E-1", "num_feature": "3"},
+                         "gradient_booster": {"name": "gbtree", "model": {"trees": [tree]}}}}
+        x, out = self.path("x.json", m), self.path("x.txt")
+        self.refused("convert", "xgboost", x, "-o", out, pattern=r"no feature names.*--feature-ids")
+        self.refused("convert", "xgboost", "--feature-ids", "5,7", x, "-o", out, pattern=r"gives 2 ids .* 3 features")
+        self.ok("convert", "xgboost", "--feature-ids", "5, 7,9", x, "-o", out)  # the model may follow the ids
+        self.assertRegex(self.ok("inspect", out), r"feature mapping +3: 5, 7, 9")
+
+
 class ModelGuard(Tool):
     def test_rejected_model_never_reaches_the_store(self):
         good = self.path("good.txt", model_text())

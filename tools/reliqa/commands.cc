@@ -1,15 +1,16 @@
 #include "tools/reliqa/commands.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <iostream>
 #include <memory>
+#include <system_error>
 
 #include "host/keystash/SqliteKeyValueStore.h"
 #include "reliqaclassifier/FeatureExtraction.h"
@@ -40,12 +41,10 @@ void warn(const std::string& file, const std::string& what) {
 
 // Creates every missing directory above `path`.
 void makeParents(const std::string& path) {
-  for (size_t slash = path.find('/', 1); slash != std::string::npos; slash = path.find('/', slash + 1)) {
-    std::string dir = path.substr(0, slash);
-    if (::mkdir(dir.c_str(), 0755) != 0 && errno != EEXIST) {
-      throw ToolError(path, 0, "cannot create the directory " + dir + ": " + std::strerror(errno));
-    }
-  }
+  const std::filesystem::path parent = std::filesystem::path(path).parent_path();
+  std::error_code error;
+  if (!parent.empty()) std::filesystem::create_directories(parent, error);
+  if (error) throw ToolError(path, 0, "cannot create the directory " + parent.string() + ": " + error.message());
 }
 
 std::shared_ptr<PersistentKeyValueStore> openStore(const std::string& path) {
@@ -277,7 +276,7 @@ void pdp(const PdpOptions& o, ResultWriter& out) {
 
 void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
   std::string name = displayName(o.input);
-  std::vector<int64_t> given = o.featureIds.empty() ? std::vector<int64_t>{} : parseIdList(o.featureIds);
+  std::vector<int64_t> given = parseIdList(o.featureIds);
   if (o.input.size() > 4 && o.input.compare(o.input.size() - 4, 4, ".ubj") == 0) {
     throw ToolError(name, 0, "binary (UBJSON) models cannot be read; save the model as JSON: save_model(\"model.json\")");
   }

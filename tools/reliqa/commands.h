@@ -57,7 +57,7 @@ void pdp(const PdpOptions& o, ResultWriter& out);
 
 struct ConvertOptions {
   std::string input;
-  std::string featureIds;  // empty: from the feature names
+  std::vector<std::string> featureIds;  // split at commas; none: from the feature names
   std::string output;      // "-" is standard output
 };
 void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose);

@@ -2,9 +2,10 @@
 
 #include <glog/logging.h>
 
+#include <charconv>
 #include <cmath>
-#include <limits>
 #include <optional>
+#include <system_error>
 
 #include "reliqaclassifier/ServerFeatureText.h"
 #include "tools/reliqa/json_doc.h"
@@ -21,23 +22,14 @@ using thornvale::FeatureMap;
 
 namespace {
 
-// Strict decimal id: optional '-', then 1 to 10 digits, within int32.
+// Strict decimal id: optional '-', then 1 to 10 digits (no more than int32
+// needs, leading zeros included), within int32.
 std::optional<int32_t> strictId(std::string_view key) {
-  size_t i = 0;
-  bool negative = false;
-  if (i < key.size() && key[i] == '-') {
-    negative = true;
-    ++i;
-  }
-  if (i == key.size() || key.size() - i > 10) return std::nullopt;
-  int64_t v = 0;
-  for (; i < key.size(); ++i) {
-    if (key[i] < '0' || key[i] > '9') return std::nullopt;
-    v = v * 10 + (key[i] - '0');
-  }
-  if (negative) v = -v;
-  if (v < std::numeric_limits<int32_t>::min() || v > std::numeric_limits<int32_t>::max()) return std::nullopt;
-  return static_cast<int32_t>(v);
+  const size_t digits = key.size() - (!key.empty() && key[0] == '-' ? 1 : 0);
+  int32_t id = 0;
+  const auto [end, error] = std::from_chars(key.data(), key.data() + key.size(), id);
+  if (error != std::errc() || end != key.data() + key.size() || digits > 10) return std::nullopt;
+  return id;
 }
 
 // Why the store would not give `x` back as the same number, or nothing when

@@ -68,20 +68,16 @@ void row(std::ostringstream& out, const char* label, const std::string& value) {
 
 }  // namespace
 
+// The model reader's own functions, each over the first line: is_header()
+// gives the version (and logs a bad header again), read_int32() the magic.
 ModelHeader readModelHeader(const std::string& modelText) {
+  const std::string firstLine = modelText.substr(0, modelText.find('\n'));
+  std::istringstream forMagic(firstLine);
+  std::istringstream forVersion(firstLine);
   ModelHeader h;
-  std::string first = modelText.substr(0, modelText.find('\n'));
-  std::string bytes = thornvale::base64_decode(first);
-  auto int32At = [&](size_t at) {
-    uint32_t v = 0;
-    for (size_t i = 0; i < 4 && at + i < bytes.size(); ++i) {
-      v |= static_cast<uint32_t>(static_cast<unsigned char>(bytes[at + i])) << (8 * i);
-    }
-    return static_cast<int32_t>(v);
-  };
-  h.complete = bytes.size() >= 8;
-  h.magic = int32At(0);
-  h.version = int32At(4);
+  h.complete = thornvale::base64_decode(firstLine).size() >= 8;
+  h.magic = thornvale::read_int32(forMagic);
+  h.version = thornvale::is_header(forVersion);
   return h;
 }
 

@@ -26,7 +26,7 @@ struct ModelHeader {
   int32_t version = 0;
 };
 
-// The header of a model text, decoded as the reader decodes it.
+// The header of a model text, as the model reader reads it.
 ModelHeader readModelHeader(const std::string& modelText);
 
 // `sixteenBit` is the width the engine chose for this forest.

@@ -167,14 +167,7 @@ simdjson::ondemand::array JsonDoc::getArray(simdjson::ondemand::value& v, const 
   return take(v.get_array(), path);
 }
 
-std::string_view JsonDoc::tokenOf(simdjson::ondemand::value& v) {
-  std::string_view token = v.raw_json_token();
-  while (!token.empty() && (token.back() == ' ' || token.back() == '\n' || token.back() == '\r' ||
-                            token.back() == '\t')) {
-    token.remove_suffix(1);
-  }
-  return token;
-}
+std::string_view JsonDoc::tokenOf(simdjson::ondemand::value& v) { return simdjson::trim(v.raw_json_token()); }
 
 namespace {
 

@@ -162,7 +162,9 @@ Handler defineConvertXgboost(CLI::App& cmd) {
   cmd.add_option("MODEL", o->input, "XGBoost JSON model (save_model(\"model.json\"))")->required();
   cmd.add_option("--feature-ids", o->featureIds,
                  "comma-separated feature ids, one per XGBoost feature in order (default: the feature "
-                 "names, which must then be integers)");
+                 "names, which must then be integers)")
+      ->delimiter(',')
+      ->allow_extra_args(false);  // one list per occurrence: MODEL may follow
   cmd.add_option("-o,--output", o->output, "output model text (- for standard output)")->required();
   return [o](Context& c) { convertXgboost(*o, *c.out, c.verbose); };
 }

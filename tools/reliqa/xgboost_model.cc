@@ -1,14 +1,19 @@
 #include "tools/reliqa/xgboost_model.h"
 
-#include <cerrno>
+#include <double-conversion/double-conversion.h>
+
+#include <algorithm>
+#include <charconv>
+#include <climits>
 #include <cmath>
-#include <cstdlib>
 #include <limits>
+#include <optional>
 #include <set>
+#include <system_error>
 
 #include "tools/reliqa/errors.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "tools/reliqa/json_doc.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 
 namespace reliqa::tool {
 
@@ -46,16 +51,35 @@ void forEachElement(JsonDoc& doc, array arr, const std::string& path, F&& onElem
   }
 }
 
+// A float as C's strtof reads a whole text in the "C" locale: white space, an
+// optional sign, then decimal or hexadecimal ("0x1p-1") digits with an
+// optional exponent, correctly rounded to a float (not through a double), and
+// nothing after them. A value beyond the float range reads as an infinity; the
+// words inf and nan are not numbers here.
+std::optional<float> textToFloat(std::string_view text) {
+  using double_conversion::StringToDoubleConverter;
+  static const StringToDoubleConverter converter(
+      StringToDoubleConverter::ALLOW_LEADING_SPACES | StringToDoubleConverter::ALLOW_HEX |
+          StringToDoubleConverter::ALLOW_HEX_FLOATS,
+      std::numeric_limits<double>::quiet_NaN(), std::numeric_limits<double>::quiet_NaN(), nullptr, nullptr);
+  // Longer texts than the converter takes are never numbers.
+  if (text.size() > static_cast<size_t>(INT_MAX)) return std::nullopt;
+  int used = 0;
+  const float f = converter.StringToFloat(text.data(), static_cast<int>(text.size()), &used);
+  if (std::isnan(f) || static_cast<size_t>(used) != text.size()) return std::nullopt;
+  return f;
+}
+
 // A float exactly as XGBoost wrote it (parsed as float, not via double). A
 // number beyond the float range is refused; one below it keeps its rounded
 // value (XGBoost writes subnormal floats).
 float readFloat(JsonDoc& doc, value& v, const std::string& path) {
   doc.getDouble(v, path);  // type and syntax check
   const std::string token(JsonDoc::tokenOf(v));
-  errno = 0;
-  float f = std::strtof(token.c_str(), nullptr);
-  if (errno == ERANGE && std::isinf(f)) doc.fail(v, path + ": " + token + " is outside the range of a float");
-  return f;
+  std::optional<float> f = textToFloat(token);
+  if (!f) doc.fail(v, path + ": malformed number " + quoteForMessage(token));
+  if (std::isinf(*f)) doc.fail(v, path + ": " + token + " is outside the range of a float");
+  return *f;
 }
 
 // XGBoost writes its scalar parameters as strings ("74", "5E-1"); newer
@@ -67,16 +91,33 @@ std::string paramText(JsonDoc& doc, value& v, const std::string& path) {
   return doc.getString(v, path);
 }
 
+// The whole text as a decimal int64 with an optional '+' or '-'; none when it
+// is anything else or out of range.
+std::optional<int64_t> wholeDecimal(std::string_view text) {
+  // from_chars itself takes a '-' only.
+  if (text.size() > 1 && text[0] == '+' && text[1] >= '0' && text[1] <= '9') text.remove_prefix(1);
+  int64_t value = 0;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
+  if (error != std::errc() || end != text.data() + text.size()) return std::nullopt;
+  return value;
+}
+
+// An integer parameter: C white space, an optional sign and decimal digits,
+// then only JSON white space. The text ends at a zero byte; a non-empty text
+// of JSON white space alone reads as 0.
 int64_t paramInt(JsonDoc& doc, value& v, const std::string& path) {
-  std::string text = paramText(doc, v, path);
-  char* end = nullptr;
-  errno = 0;
-  long long x = std::strtoll(text.c_str(), &end, 10);
-  while (end && (*end == ' ' || *end == '\n' || *end == '\t' || *end == '\r')) ++end;
-  if (text.empty() || errno != 0 || *end != '\0') {
-    doc.fail(v, path + ": expected an integer, got " + quoteForMessage(text));
+  const std::string text = paramText(doc, v, path);
+  std::string_view number = std::string_view(text).substr(0, text.find('\0'));
+  std::optional<int64_t> x;
+  if (number.find_first_not_of(" \t\n\r") == std::string_view::npos) {
+    if (!text.empty()) x = 0;
+  } else {
+    const size_t end = number.find_last_not_of(" \t\n\r") + 1;
+    const size_t start = std::min(number.find_first_not_of(" \t\n\v\f\r"), end);
+    x = wholeDecimal(number.substr(start, end - start));
   }
-  return x;
+  if (!x) doc.fail(v, path + ": expected an integer, got " + quoteForMessage(text));
+  return *x;
 }
 
 std::vector<int32_t> readInts(JsonDoc& doc, value& v, const std::string& path) {
@@ -246,11 +287,12 @@ class XgbReader {
         doc_.fail(v, path + ": one base score per output; multi-output models cannot be converted");
       }
     }
-    char* end = nullptr;
-    m_.baseScore = std::strtof(baseScoreText_.c_str(), &end);
-    if (baseScoreText_.empty() || *end != '\0') {
+    // The text ends at a zero byte.
+    std::optional<float> score = textToFloat(std::string_view(baseScoreText_).substr(0, baseScoreText_.find('\0')));
+    if (baseScoreText_.empty() || !score) {
       doc_.fail(v, path + ": expected a number, got " + quoteForMessage(baseScoreText_));
     }
+    m_.baseScore = *score;
   }
 
   void readBooster(value& v, const std::string& path) {
@@ -329,25 +371,21 @@ XgbModel readXgboostModel(std::string_view json, const std::string& name) {
   return XgbReader(doc).read();
 }
 
-std::vector<int64_t> parseIdList(const std::string& text) {
-  std::vector<int64_t> out;
-  size_t i = 0;
-  while (true) {
-    while (i < text.size() && text[i] == ' ') ++i;
-    size_t start = i;
-    if (i < text.size() && (text[i] == '-' || text[i] == '+')) ++i;
-    size_t digits = i;
-    while (i < text.size() && text[i] >= '0' && text[i] <= '9') ++i;
-    if (i == digits || i - digits > 18) {
-      throw UsageError("--feature-ids: expected comma-separated integers, got " + quoteForMessage(text));
+std::vector<int64_t> parseIdList(const std::vector<std::string>& items) {
+  std::vector<int64_t> ids;
+  for (const std::string& item : items) {
+    if (item.empty()) continue;
+    const size_t end = item.find_last_not_of(' ') + 1;  // 0 for spaces alone
+    const size_t start = std::min(item.find_first_not_of(' '), end);
+    const std::string_view text = std::string_view(item).substr(start, end - start);
+    const size_t digits = text.size() - (!text.empty() && (text[0] == '-' || text[0] == '+') ? 1 : 0);
+    std::optional<int64_t> id = wholeDecimal(text);
+    if (!id || digits > 18) {
+      throw UsageError("--feature-ids: expected comma-separated integers, got " + quoteForMessage(item));
     }
-    out.push_back(std::strtoll(text.substr(start, i - start).c_str(), nullptr, 10));
-    while (i < text.size() && text[i] == ' ') ++i;
-    if (i == text.size()) break;
-    if (text[i] != ',') throw UsageError("--feature-ids: expected comma-separated integers, got " + quoteForMessage(text));
-    ++i;
+    ids.push_back(*id);
   }
-  return out;
+  return ids;
 }
 
 std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64_t>& given, const std::string& name) {
@@ -359,17 +397,17 @@ std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64
                       "with --feature-ids 1,2,... (" + std::to_string(model.numFeature) + " ids)");
     }
     for (const std::string& n : model.featureNames) {
-      bool integer = !n.empty() && n.size() <= 11;
-      for (size_t i = 0; i < n.size() && integer; ++i) {
-        integer = (n[i] >= '0' && n[i] <= '9') || (i == 0 && n[i] == '-' && n.size() > 1);
-      }
-      if (!integer) {
+      // As long as the longest 32-bit id ("-2147483648") at most; the range
+      // is checked below.
+      int64_t id = 0;
+      const auto [end, error] = std::from_chars(n.data(), n.data() + n.size(), id);
+      if (error != std::errc() || end != n.data() + n.size() || n.size() > 11) {
         throw ToolError(name, 0,
                         "feature name " + quoteForMessage(n) +
                             " is not an integer feature id; give one id per feature with --feature-ids 1,2,... (" +
                             std::to_string(model.numFeature) + " ids, in the order of the model's features)");
       }
-      ids.push_back(std::strtoll(n.c_str(), nullptr, 10));
+      ids.push_back(id);
     }
   } else if (static_cast<int64_t>(ids.size()) != model.numFeature) {
     throw UsageError("--feature-ids gives " + std::to_string(ids.size()) + " ids but the model has " +

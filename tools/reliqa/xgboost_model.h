@@ -60,7 +60,9 @@ std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64
 
 std::unique_ptr<thornvale::Forest> toForest(const XgbModel& model, const std::vector<int32_t>& featureIds);
 
-// Parses "1,2,3" (white space allowed around ids); throws UsageError.
-std::vector<int64_t> parseIdList(const std::string& text);
+// The ids of --feature-ids, one item each as the option splits its text at
+// commas: an optional sign and at most 18 decimal digits, with spaces around;
+// empty items are skipped. Throws UsageError naming the item.
+std::vector<int64_t> parseIdList(const std::vector<std::string>& items);
 
 }  // namespace reliqa::tool

@@ -94,9 +94,32 @@ TEST(XgboostModel, FeatureIdsComeFromNamesOrTheCommandLine) {
   EXPECT_THAT(errorOf(model(kTree0, R"(["1","2","1"])")), HasSubstr("feature id 1 is given twice"));
   EXPECT_THAT(errorOf(model(kTree0), {1, 2}), HasSubstr("gives 2 ids but the model has 3 features"));
   EXPECT_THAT(errorOf(model(kTree0), {1, 2, 4294967296}), HasSubstr("not a 32-bit integer"));
-  EXPECT_EQ(parseIdList(" 1, 2,-3"), (std::vector<int64_t>{1, 2, -3}));
-  EXPECT_THROW(parseIdList("1,,2"), UsageError);
-  EXPECT_THROW(parseIdList("1;2"), UsageError);
+}
+
+TEST(XgboostModel, FeatureIdItemsAreDecimalIntegers) {
+  // Items as CLI11 hands them over after splitting at commas.
+  EXPECT_EQ(parseIdList({" 1", " 2 ", "-3", "+4", "010", "", "-123456789012345678"}),
+            (std::vector<int64_t>{1, 2, -3, 4, 10, -123456789012345678}));
+  EXPECT_TRUE(parseIdList({""}).empty());
+  for (const char* bad : {"1;2", " ", "+", "-", "+-5", "1 2", "\t1", "0x10", "1e3", "1234567890123456789"}) {
+    EXPECT_THROW(parseIdList({"1", bad}), UsageError) << bad;
+  }
+}
+
+TEST(XgboostModel, ReadsParametersAsXgboostWritesThem) {
+  auto withParams = [](const std::string& baseScore, const std::string& numFeature) {
+    std::string m = model(kTree0);
+    m.replace(m.find("\"3E-1\""), 6, baseScore);
+    m.replace(m.find("\"num_feature\":\"3\"", m.find("learner_model_param")), 17, "\"num_feature\":" + numFeature);
+    return m;
+  };
+  EXPECT_EQ(readXgboostModel(withParams("\"[2.5E-1]\"", "3 "), "m.json").baseScore, 0.25f);
+  EXPECT_EQ(readXgboostModel(withParams("0.1", "\" +3\""), "m.json").baseScore, 0.1f);  // as a float, not a double
+  EXPECT_THAT(errorOf(withParams("\"0.5x\"", "3")), HasSubstr("base_score: expected a number, got \"0.5x\""));
+  EXPECT_THAT(errorOf(withParams("\"[0.5,0.5]\"", "3")), HasSubstr("one base score per output"));
+  EXPECT_THAT(errorOf(withParams("\"1.5\"", "3")), HasSubstr("base_score 1.5 is not a probability"));
+  EXPECT_THAT(errorOf(withParams("0.5", "\"3.0\"")), HasSubstr("num_feature: expected an integer, got \"3.0\""));
+  EXPECT_THAT(errorOf(withParams("0.5", "\"99999999999999999999\"")), HasSubstr("expected an integer"));
 }
 
 TEST(XgboostModel, RefusesWhatCannotBeRepresented) {

@@ -39,6 +39,8 @@ using mobile::xplat::keystash::FaultInjectingKeyValueStore;
 using mobile::xplat::keystash::InMemoryKeyValueStore;
 using mobile::xplat::keystash::PersistentKeyValueStoreHybrid;
 
+constexpr auto kNativeReference = managed::join(managed::kModelsPackage, "NativeReference");
+
 std::string bits(double value) {
   long long pattern;
   std::memcpy(&pattern, &value, sizeof pattern);
@@ -190,8 +192,7 @@ void registerMissingNative() {
        reinterpret_cast<void*>(&registerMissingNative)},
   };
   JNIEnv* env = jni::Environment::current();
-  jni::LocalRef<jclass> cls =
-      jni::findClassLocal("com/kestrova/sharefold/reliqaclassifier/models/NativeReference");
+  jni::LocalRef<jclass> cls = jni::findClassLocal(kNativeReference);
   jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, 1) != JNI_OK);
 }
 
@@ -224,41 +225,37 @@ void attachTwice(JNIEnv* env, jclass) {
 }
 
 void registerNatives() {
+  using managed::join;
+  static constexpr auto kInputType = managed::typeOf(managed::kInput);
+  static constexpr auto kDescribeInput = join("(", kInputType, ")", managed::kStringType);
+  static constexpr auto kDescribeServerFeatures =
+      join("(", managed::typeOf(managed::kServerFeatures), ")", managed::kStringType);
+  static constexpr auto kClassifyDirectly =
+      join("(", managed::kStoreType, kInputType, ")", managed::kStringType);
+  static constexpr auto kClassifyNatively = join("(", managed::kStoreType, kInputType, "I)J");
+  static constexpr auto kReadNatively = join("(", kInputType, "I)J");
+  static constexpr auto kFailingStore = join("()", managed::kStoreType);
   static const JNINativeMethod methods[] = {
       {const_cast<char*>("timeBits"), const_cast<char*>("()I"), reinterpret_cast<void*>(&timeBits)},
-      {const_cast<char*>("describeInput"),
-       const_cast<char*>(
-           "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;)"
-           "Ljava/lang/String;"),
+      {const_cast<char*>("describeInput"), const_cast<char*>(kDescribeInput.text),
        reinterpret_cast<void*>(&describeInput)},
-      {const_cast<char*>("describeServerFeatures"),
-       const_cast<char*>(
-           "(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierServerFeatures;)"
-           "Ljava/lang/String;"),
+      {const_cast<char*>("describeServerFeatures"), const_cast<char*>(kDescribeServerFeatures.text),
        reinterpret_cast<void*>(&describeServerFeatures)},
-      {const_cast<char*>("classifyDirectly"),
-       const_cast<char*>(
-           "(Lcom/kestrova/keystash/PersistentKeyValueStore;"
-           "Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;)"
-           "Ljava/lang/String;"),
+      {const_cast<char*>("classifyDirectly"), const_cast<char*>(kClassifyDirectly.text),
        reinterpret_cast<void*>(&classifyDirectly)},
       {const_cast<char*>("initializeWithFailingRegistration"), const_cast<char*>("()V"),
        reinterpret_cast<void*>(&initializeWithFailingRegistration)},
       {const_cast<char*>("attachTwice"), const_cast<char*>("()V"),
        reinterpret_cast<void*>(&attachTwice)},
-      {const_cast<char*>("classifyNatively"),
-       const_cast<char*>("(Lcom/kestrova/keystash/PersistentKeyValueStore;"
-                         "Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;I)J"),
+      {const_cast<char*>("classifyNatively"), const_cast<char*>(kClassifyNatively.text),
        reinterpret_cast<void*>(&classifyNatively)},
-      {const_cast<char*>("readNatively"),
-       const_cast<char*>("(Lcom/kestrova/sharefold/reliqaclassifier/models/ReliqaClassifierInput;I)J"),
+      {const_cast<char*>("readNatively"), const_cast<char*>(kReadNatively.text),
        reinterpret_cast<void*>(&readNatively)},
-      {const_cast<char*>("failingStore"), const_cast<char*>("()Lcom/kestrova/keystash/PersistentKeyValueStore;"),
+      {const_cast<char*>("failingStore"), const_cast<char*>(kFailingStore.text),
        reinterpret_cast<void*>(&failingStore)},
   };
   JNIEnv* env = jni::Environment::current();
-  jni::LocalRef<jclass> cls =
-      jni::findClassLocal("com/kestrova/sharefold/reliqaclassifier/models/NativeReference");
+  jni::LocalRef<jclass> cls = jni::findClassLocal(kNativeReference);
   jni::throwCppExceptionIf(env->RegisterNatives(cls.get(), methods, static_cast<jint>(std::size(methods))) != JNI_OK);
 }
 

@@ -5,8 +5,8 @@
 // the whole input for a malformed number, or the unconsumed rest when a number
 // is followed by other characters), "<reason>: (<type>) <value>" for a number
 // conversion that would lose precision, and exactly "Empty input string" for an
-// empty input. These are the texts that stored values have always produced, so
-// callers may show them to users or match them in logs.
+// empty input. The texts are fixed, so callers may show them to users or match
+// them in logs.
 #pragma once
 
 #include <stdexcept>

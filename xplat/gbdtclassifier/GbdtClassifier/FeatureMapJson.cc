@@ -53,14 +53,6 @@ const char* typeName(JsonScalar::Kind kind) {
 
 bool isDigit(char c) { return c >= '0' && c <= '9'; }
 
-std::string_view trimTrailingSpace(std::string_view token) {
-  while (!token.empty() &&
-         (token.back() == ' ' || token.back() == '\t' || token.back() == '\n' || token.back() == '\r')) {
-    token.remove_suffix(1);
-  }
-  return token;
-}
-
 JsonScalar makeDouble(double value) {
   JsonScalar scalar;
   scalar.kind = JsonScalar::Kind::kDouble;
@@ -97,18 +89,18 @@ JsonScalar parseNumber(std::string_view token) {
 
 // Reads a value whose type simdjson could not name: the words NaN and Infinity.
 JsonScalar parseNonFiniteWord(std::string_view token, simdjson::error_code error) {
-  token = trimTrailingSpace(token);
   if (token == "NaN") return makeDouble(std::numeric_limits<double>::quiet_NaN());
   if (token == "Infinity") return makeDouble(std::numeric_limits<double>::infinity());
   failParse(error);
 }
 
-std::string_view rawToken(ondemand::value& value) { return value.raw_json_token(); }
+// A value's text without the white space that follows it.
+std::string_view rawToken(ondemand::value& value) { return simdjson::trim(value.raw_json_token()); }
 
 std::string_view rawToken(ondemand::document& document) {
   std::string_view token;
   if (auto error = document.raw_json_token().get(token)) failParse(error);
-  return token;
+  return simdjson::trim(token);
 }
 
 template <typename Value>
@@ -118,7 +110,7 @@ JsonScalar readValue(Value& value) {
   JsonScalar scalar;
   switch (type) {
     case ondemand::json_type::number:
-      return parseNumber(trimTrailingSpace(rawToken(value)));
+      return parseNumber(rawToken(value));
     case ondemand::json_type::string:
       scalar.kind = JsonScalar::Kind::kString;
       if (auto error = value.get_string().get(scalar.text)) failParse(error);
@@ -174,7 +166,7 @@ struct Member {
 }  // namespace
 
 FeatureMap featureMapFromJson(std::string_view json) {
-  // A NUL byte ends the text, as it always did for stored values.
+  // A NUL byte ends the text.
   json = json.substr(0, json.find('\0'));
   simdjson::padded_string padded(json);
   ondemand::parser parser;

@@ -1,7 +1,7 @@
-// Reads a feature map back from the JSON text that JsonWriter.h writes (and that
-// earlier builds wrote for stored server features).
+// Reads a feature map back from JSON: the text that JsonWriter.h writes, and
+// any stored server-feature text of the shapes below.
 //
-// The text must be one JSON object. Each member name is read as a decimal
+// The text must be one JSON object; a NUL byte ends it. Each member name is read as a decimal
 // integer (surrounding white space and a leading "+" allowed, e.g. "4", "04",
 // " 4") and narrowed to 32 bits by two's complement; each member value must be a
 // number, true/false (1/0) or a string holding a number.

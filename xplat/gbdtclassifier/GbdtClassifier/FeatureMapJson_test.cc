@@ -1,5 +1,5 @@
 // The JSON writer and reader together: what is written reads back, and stored
-// texts of every shape read back the way stored values always did.
+// texts of every other shape read by the rules of FeatureMapJson.h.
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMapJson.h"
 
 #include <gtest/gtest.h>

@@ -2,14 +2,14 @@
 //
 // JsonPrintError: a value cannot be written as JSON (NaN or an infinity). Its
 //   text names the value's place, e.g. "folly::toJson: JSON object value was a
-//   NaN when serializing value at \"7\"": this is the text that earlier builds
-//   reported for the same failure, kept so that logs stay comparable.
+//   NaN when serializing value at \"7\"", the text that the managed side and
+//   the logs know for this failure.
 // JsonParseError: the text is not well-formed JSON of the expected shape.
 // JsonTypeError: well-formed JSON holding a value of the wrong type where a
 //   number (or an object) is needed.
 //
 // Bad numbers inside otherwise well-formed JSON are reported as ConversionError
-// (ConversionError.h), as they always were.
+// (ConversionError.h).
 #pragma once
 
 #include <stdexcept>

@@ -177,24 +177,21 @@ int64_t textToInt64(std::string_view text) {
   if (pos == text.size()) fail(kNoDigits, text);
   if (!isDigit(text[pos])) fail(kNonDigit, text);
 
+  // The digits are read as a magnitude, so that the sign decides which
+  // overflow is reported, also where the magnitude exceeds 64 bits.
   uint64_t magnitude = 0;
-  for (; pos < text.size() && isDigit(text[pos]); ++pos) {
-    unsigned digit = static_cast<unsigned>(text[pos] - '0');
-    if (magnitude > (std::numeric_limits<uint64_t>::max() - digit) / 10) {
-      fail(negative ? kNegativeOverflow : kOverflow, text);
-    }
-    magnitude = magnitude * 10 + digit;
-  }
-  int64_t value;
+  const char* const end = text.data() + text.size();
+  const auto [digitsEnd, error] = std::from_chars(text.data() + pos, end, magnitude);
+  constexpr uint64_t kInt64MinMagnitude = uint64_t{1} << 63;
   if (negative) {
-    if (magnitude > uint64_t{1} << 63) fail(kNegativeOverflow, text);
-    value = magnitude == uint64_t{1} << 63 ? std::numeric_limits<int64_t>::min()
-                                             : -static_cast<int64_t>(magnitude);
+    if (error != std::errc() || magnitude > kInt64MinMagnitude) fail(kNegativeOverflow, text);
   } else {
-    if (magnitude > static_cast<uint64_t>(std::numeric_limits<int64_t>::max())) fail(kOverflow, text);
-    value = static_cast<int64_t>(magnitude);
+    if (error != std::errc() || magnitude >= kInt64MinMagnitude) fail(kOverflow, text);
   }
-  requireOnlySpaceAfter(text.substr(pos));
+  const int64_t value = !negative                          ? static_cast<int64_t>(magnitude)
+                        : magnitude == kInt64MinMagnitude ? std::numeric_limits<int64_t>::min()
+                                                          : -static_cast<int64_t>(magnitude);
+  requireOnlySpaceAfter(std::string_view(digitsEnd, static_cast<size_t>(end - digitsEnd)));
   return value;
 }
 

@@ -6,11 +6,12 @@
 // and "<mantissa>E<exponent>" outside that span ("1E-7", "1E21"), and the words
 // "NaN", "Infinity" and "-Infinity" for non-finite values. It never fails.
 //
-// textToDouble and textToInt64 read numbers with the rules that stored values
-// were always read with: leading white space is skipped, trailing white space is
-// allowed, anything else after the number is an error. textToDouble also reads
-// "nan", "inf" and "infinity" (any case, optional "-") and returns +-Infinity or
-// 0 for out-of-range exponents. Both throw ConversionError.
+// textToDouble and textToInt64 read stored numbers: leading white space is
+// skipped, trailing white space is allowed, anything else after the number is
+// an error. textToInt64 takes an optional "+" or "-" and decimal digits
+// (leading zeros allowed) and refuses values outside int64. textToDouble also
+// reads "nan", "inf" and "infinity" (any case, optional "-") and returns
+// +-Infinity or 0 for out-of-range exponents. Both throw ConversionError.
 //
 // All functions are pure and may be called from any thread.
 #pragma once

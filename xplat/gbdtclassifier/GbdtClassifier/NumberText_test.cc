@@ -122,8 +122,11 @@ TEST(NumberTextTest, ReadsIntegersWithSignsSpaceAndOverflowChecks) {
   const std::pair<const char*, int64_t> cases[] = {
       {"4", 4},    {"04", 4},  {"-7", -7}, {"+4", 4}, {" 4", 4}, {"4 ", 4}, {"\t4\n", 4},
       {"00000000000000000000004", 4},     {"99999999999", 99999999999},
+      {"-0", 0},   {"+0", 0},
       {"9223372036854775807", std::numeric_limits<int64_t>::max()},
+      {"+9223372036854775807", std::numeric_limits<int64_t>::max()},
       {"-9223372036854775808", std::numeric_limits<int64_t>::min()},
+      {" -00000000000000000000009223372036854775808\n", std::numeric_limits<int64_t>::min()},
   };
   for (const auto& [text, value] : cases) EXPECT_EQ(textToInt64(text), value) << text;
 
@@ -133,11 +136,17 @@ TEST(NumberTextTest, ReadsIntegersWithSignsSpaceAndOverflowChecks) {
       {"abc", "Invalid leading character: \"abc\""},
       {"-", "No digits found in input string: \"-\""},
       {"- 4", "Non-digit character found: \"- 4\""},
+      {"+-4", "Non-digit character found: \"+-4\""},
+      {"4 x", "Non-whitespace character found after end of conversion: \" x\""},
       {"4.0", "Non-whitespace character found after end of conversion: \".0\""},
       {"1e3", "Non-whitespace character found after end of conversion: \"e3\""},
       {"0x10", "Non-whitespace character found after end of conversion: \"x10\""},
       {"9223372036854775808", "Overflow during conversion: \"9223372036854775808\""},
+      {"+9223372036854775808", "Overflow during conversion: \"+9223372036854775808\""},
       {"18446744073709551616", "Overflow during conversion: \"18446744073709551616\""},
+      {"00000000000000000009223372036854775808",
+       "Overflow during conversion: \"00000000000000000009223372036854775808\""},
+      {"99999999999999999999x", "Overflow during conversion: \"99999999999999999999x\""},
       {"-9223372036854775809", "Negative overflow during conversion: \"-9223372036854775809\""},
       {"-18446744073709551616", "Negative overflow during conversion: \"-18446744073709551616\""},
   };
