@@ -10,7 +10,7 @@
 #include "host/keystash/InMemoryKeyValueStore.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/ConversionError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/LogCapture.h"
 
 namespace thornvale {
 namespace {

@@ -7,9 +7,10 @@
 #include <sstream>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/ForestComparison.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/StdoutCapture.h"
 
 namespace thornvale {
 namespace {
