@@ -44,7 +44,10 @@ Forest mapped(size_t positions) {
 }
 
 // The scoring rules applied straight to the node objects, one tree after
-// another, for comparison with the compiled forests.
+// another, for comparison with the compiled forests. It walks the nodes
+// itself: Node::evaluate() and findLeaf() send NaN right at every level,
+// whereas the compiled plain walk sends it right only at the root and left
+// below it.
 double referenceRaw(const Forest& f, const std::vector<float>& x) {
   std::set<int32_t> eq;
   if (!f.featureMapping.empty()) eq.insert(f.equalityFeatures.begin(), f.equalityFeatures.end());
