@@ -8,6 +8,8 @@
 #include <random>
 #include <set>
 #include <tuple>
+#include <utility>
+#include <vector>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/ForestComparison.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
@@ -48,7 +50,13 @@ Forest mapped(size_t positions) {
 // itself: Node::evaluate() and findLeaf() send NaN right at every level,
 // whereas the compiled plain walk sends it right only at the root and left
 // below it.
-double referenceRaw(const Forest& f, const std::vector<float>& x) {
+//
+// Sub-models are not derived from modelIndexMap here: `models[m]` is the range
+// [first, end) of kept trees (those of non-zero weight) that model number m
+// sums, written out by the caller, and the selector's leaf value, truncated,
+// picks m.
+using Ranges = std::vector<std::pair<size_t, size_t>>;
+double referenceRaw(const Forest& f, const std::vector<float>& x, const Ranges& models = {}) {
   std::set<int32_t> eq;
   if (!f.featureMapping.empty()) eq.insert(f.equalityFeatures.begin(), f.equalityFeatures.end());
   auto walk = [&](const Node* n, bool equalityWalk) {
@@ -86,10 +94,7 @@ double referenceRaw(const Forest& f, const std::vector<float>& x) {
   size_t first = 0, end = kept.size();
   if (f.modelSelector.tree && f.modelSelector.weight != 0.0) {
     const float v = static_cast<float>(walk(f.modelSelector.tree->root.get(), false));
-    uint64_t m = std::isnan(v) || v < 0 ? 0 : v >= 4294967296.0f ? 4294967295u : uint64_t(v);
-    m = std::min<uint64_t>(m, f.modelIndexMap.size());
-    if (m > 0) first = std::min<size_t>(f.modelIndexMap[m - 1], kept.size());
-    if (m < f.modelIndexMap.size()) end = std::min<size_t>(f.modelIndexMap[m], kept.size());
+    std::tie(first, end) = models.at(static_cast<size_t>(v));
   }
   double sum = f.baseScore;
   for (size_t i = first; i < end; ++i) {
@@ -300,6 +305,9 @@ void checkAgainstReference(uint64_t seed) {
     Forest f = test::randomForest(rng(), count, 1 + static_cast<int>(rng() % 6), 10);
     f.trees[rng() % count].weight = 0.0;
     if (round % 3 != 0) f.equalityFeatures = {static_cast<uint32_t>(rng() % 10)};
+    // The trees that the compiled forest keeps: all but the one of weight 0.
+    const size_t kept = count - 1;
+    Ranges models;
     if (round % 2 == 1) {
       f.modelSelector = weighted(test::randomFullTree(rng, 2, 10), 1);
       std::vector<Node*> pending{f.modelSelector.tree->root.get()};
@@ -313,7 +321,10 @@ void checkAgainstReference(uint64_t seed) {
           pending.push_back(static_cast<LinearNode*>(n)->right.get());
         }
       }
-      f.modelIndexMap = {static_cast<uint32_t>(count / 3), static_cast<uint32_t>(count / 2)};
+      const size_t a = count / 3, b = count / 2;  // both at most `kept`
+      f.modelIndexMap = {static_cast<uint32_t>(a), static_cast<uint32_t>(b)};
+      // Model 3 lies past the last boundary: it sums the last model's trees.
+      models = {{0, a}, {a, b}, {b, kept}, {b, kept}};
     }
     auto e = compiled<E>(f);
     std::uniform_real_distribution<float> u(-1.2f, 1.2f);
@@ -327,13 +338,13 @@ void checkAgainstReference(uint64_t seed) {
         const auto* root = static_cast<const LinearNode*>(f.trees[0].tree->root.get());
         if (!root->isLeaf()) x[root->pivotIndex] = static_cast<float>(root->pivotValue);
       }
-      const double expected = referenceRaw(f, x);
+      const double expected = referenceRaw(f, x, models);
       ASSERT_TRUE(test::sameBits(e->unnormalizedScore(x), expected)) << round << "/" << v;
       ASSERT_TRUE(test::sameBits(e->unnormalizedScoreOneByOne(x), expected)) << round;
       ASSERT_TRUE(test::sameBits(e->score(x), logistic(expected)));
     }
     const std::vector<float> zeros(10, 0.0f);
-    EXPECT_TRUE(test::sameBits(e->unnormalizedScoreOfZeros(), referenceRaw(f, zeros)));
+    EXPECT_TRUE(test::sameBits(e->unnormalizedScoreOfZeros(), referenceRaw(f, zeros, models)));
   }
 }
 
