@@ -224,6 +224,10 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
 
   void buildEqualityMask(const Forest& forest, bool remap);
+  // The feature position that `split` of `tree` reads: its pivotIndex, or the
+  // featureMapping entry it names when remapping. Throws std::range_error
+  // past the limit of FeatureIdT or outside the feature vector.
+  int32_t splitPosition(const LinearNode& split, size_t tree) const;
   // The position that a split on `featureId` reads.
   int32_t checkedPosition(int32_t featureId, size_t tree) const {
     // Without a featureMapping every position reads 0.0; a negative one is
@@ -242,6 +246,10 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     std::vector<FlatNode> nodes;
   };
   void compileTree(const Node& root, double scale, FlatTree& out, size_t tree, CompileScratch& scratch);
+  // Claims the two slots of a split's children at the end of nodes[0, used),
+  // growing `nodes` ahead of need; returns the first. Throws std::range_error
+  // when that index cannot be stored.
+  static size_t claimChildren(std::vector<FlatNode>& nodes, size_t& used);
 
   // Selector walk result as a model number: truncation toward zero, NaN and
   // negative values give 0, values beyond the range the largest value.
@@ -567,67 +575,71 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::throwBadPosition(int32_t featu
 }
 
 template <typename FeatureIdT, typename NodeIndexT>
+int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::splitPosition(const LinearNode& split, size_t tree) const {
+  int32_t id = split.pivotIndex;
+  if (remap_) {
+    if (id < 0 || static_cast<uint64_t>(id) >= featureMapping_.size()) {
+      throw std::range_error("split in " + label(tree) + " tests feature position " + std::to_string(id) +
+                             ", outside the featureMapping of " + std::to_string(featureMapping_.size()) +
+                             " entries");
+    }
+    id = static_cast<int32_t>(featureMapping_[id]);
+  }
+  if (int64_t{id} > kMaxFeatureId) {
+    throw std::range_error("feature id > max size. Use large type for FeatureIdT");
+  }
+  return checkedPosition(id, tree);
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
+size_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::claimChildren(std::vector<FlatNode>& nodes, size_t& used) {
+  const size_t first = used;
+  if (first >= kNodeIndexLimit) {
+    throw std::range_error("node index > max size. Use large type for NodeIndexT");
+  }
+  // Growing ahead of need keeps adding a split's children to two stores.
+  if (first + 2 > nodes.size()) nodes.resize(2 * nodes.size());
+  used = first + 2;
+  return first;
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
 void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, double scale,
                                                               FlatTree& out, size_t tree,
                                                               CompileScratch& scratch) {
   std::vector<Pending>& pending = scratch.pending;
-  // The buffer grows ahead of need, so that adding a split's children is two
-  // stores and no call; `used` is its part that holds this tree.
-  std::vector<FlatNode>& nodes = scratch.nodes;
+  std::vector<FlatNode>& nodes = scratch.nodes;  // nodes[0, used) hold this tree
   if (nodes.size() < 64) nodes.resize(64);
   size_t used = 1;
   out.hasEqualityFeature = false;
   out.depth = 0;
   out.leafDepth = std::numeric_limits<uint32_t>::max();
   // Depth first: go down each left spine at once, keeping right children for
-  // later, so that left subtrees are laid out before right ones.
+  // later, so that left subtrees are laid out before right ones. A node's slot
+  // is written when the walk reaches it.
   pending.assign(1, Pending{&root, 0, 0});
   while (!pending.empty()) {
     Pending p = pending.back();
     pending.pop_back();
     for (;;) {
-      const Node* node = p.node;
-      if (node == nullptr) {
-        throw std::runtime_error(label(tree) + " has a split without both children");
-      }
+      if (p.node == nullptr) throw std::runtime_error(label(tree) + " has a split without both children");
       out.depth = std::max(out.depth, p.depth);
-      if (node->isLeaf()) {
+      if (p.node->isLeaf()) {
         out.leafDepth = std::min(out.leafDepth, p.depth);
-        nodes[p.slot].featureId = kLeaf;
-        nodes[p.slot].child = 0;
-        nodes[p.slot].value =
-            static_cast<float>(static_cast<const ConstantNode*>(node)->value * scale);
+        const double value = static_cast<const ConstantNode*>(p.node)->value * scale;
+        nodes[p.slot] = FlatNode{kLeaf, 0, static_cast<float>(value)};
         break;
       }
-      const auto& split = *static_cast<const LinearNode*>(node);
-      int32_t id = split.pivotIndex;
-      if (remap_) {
-        if (id < 0 || static_cast<uint64_t>(id) >= featureMapping_.size()) {
-          throw std::range_error("split in " + label(tree) + " tests feature position " +
-                                 std::to_string(id) + ", outside the featureMapping of " +
-                                 std::to_string(featureMapping_.size()) + " entries");
-        }
-        id = static_cast<int32_t>(featureMapping_[id]);
-      }
-      if (int64_t{id} > kMaxFeatureId) {
-        throw std::range_error("feature id > max size. Use large type for FeatureIdT");
-      }
-      const int32_t position = checkedPosition(id, tree);
-      const size_t first = used;
-      if (first >= kNodeIndexLimit) {
-        throw std::range_error("node index > max size. Use large type for NodeIndexT");
-      }
-      if (first + 2 > nodes.size()) nodes.resize(2 * nodes.size());
-      used = first + 2;
-      FlatNode& n = nodes[p.slot];
-      n.featureId = static_cast<FeatureIdT>(position);
-      n.value = static_cast<float>(split.pivotValue);
-      n.child = static_cast<NodeIndexT>(first);
+      const auto& split = *static_cast<const LinearNode*>(p.node);
+      const int32_t position = splitPosition(split, tree);
+      const size_t first = claimChildren(nodes, used);
+      nodes[p.slot] = FlatNode{static_cast<FeatureIdT>(position), static_cast<NodeIndexT>(first),
+                               static_cast<float>(split.pivotValue)};
       if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
       requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
-      // The children's slots are written when the walk reaches them. The
-      // work item is written field by field: a whole temporary copied in
-      // would be read back before its parts are stored, which stalls loads.
+      // The right child waits; the walk goes on with the left one. The work
+      // item is written field by field: a whole temporary copied in would be
+      // read back before its parts are stored, which stalls loads.
       const uint32_t below = p.depth == UINT32_MAX ? p.depth : p.depth + 1;
       Pending& right = pending.emplace_back();
       right.node = split.right.get();
