@@ -30,6 +30,7 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
 
 namespace thornvale {
 namespace {
