@@ -302,7 +302,8 @@ void checkAgainstReference(uint64_t seed) {
   std::mt19937_64 rng(seed);
   for (int round = 0; round < 12; ++round) {
     const size_t count = 1 + rng() % 40;
-    Forest f = test::randomForest(rng(), count, 1 + static_cast<int>(rng() % 6), 10);
+    const int depth = 1 + static_cast<int>(rng() % 6);  // drawn apart: argument order varies
+    Forest f = test::randomForest(rng(), count, depth, 10);
     f.trees[rng() % count].weight = 0.0;
     if (round % 3 != 0) f.equalityFeatures = {static_cast<uint32_t>(rng() % 10)};
     // The trees that the compiled forest keeps: all but the one of weight 0.
@@ -365,8 +366,8 @@ void checkKernels(uint64_t seed, int32_t numFeatures) {
   std::mt19937_64 rng(seed);
   for (int round = 0; round < 6; ++round) {
     const size_t count = 1 + rng() % (2 * kWalkGroup + 20);
-    Forest f = test::randomForest(rng(), count, 1 + static_cast<int>(rng() % 10), numFeatures,
-                                     false, round % 2 ? 0.3 : 0.0);
+    const int depth = 1 + static_cast<int>(rng() % 10);  // drawn apart: argument order varies
+    Forest f = test::randomForest(rng(), count, depth, numFeatures, false, round % 2 ? 0.3 : 0.0);
     for (size_t i = 0; i < count; i += 1 + rng() % 16) {
       switch (rng() % 4) {
         case 0: f.trees[i].tree->root = leaf(0.25 * static_cast<double>(i)); break;

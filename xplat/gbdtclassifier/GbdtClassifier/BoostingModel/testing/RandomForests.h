@@ -1,6 +1,6 @@
 // For the engine's tests, benchmarks and sample generators: random trees and
-// forests, the same for the same seed under one standard library (the
-// distributions are its own). The caller owns what they return; nodes come
+// forests, the same for the same seed under every compiler and one standard
+// library (the distributions are its own). The caller owns what they return; nodes come
 // from the heap. Header-only; not part of the library.
 #pragma once
 
@@ -37,7 +37,11 @@ inline std::unique_ptr<Node> randomFullTree(std::mt19937_64& rng, int depth, int
       *slot = leaf(value(rng));
       continue;
     }
-    auto s = std::make_unique<LinearNode>(feature(rng), pivot(rng));
+    // One draw per statement: the order of a call's arguments differs between
+    // compilers.
+    const double threshold = pivot(rng);
+    const int32_t index = feature(rng);
+    auto s = std::make_unique<LinearNode>(index, threshold);
     LinearNode* raw = s.get();
     *slot = std::move(s);
     pending.emplace_back(&raw->right, d - 1);
@@ -56,7 +60,8 @@ inline Forest randomForest(uint64_t seed, size_t count, int depth, int32_t numFe
   Forest f;
   f.baseScore = -0.25;
   for (size_t i = 0; i < count; ++i) {
-    f.trees.push_back(weighted(randomFullTree(rng, depth, numFeatures, earlyLeaf), weight(rng)));
+    const double w = weight(rng);
+    f.trees.push_back(weighted(randomFullTree(rng, depth, numFeatures, earlyLeaf), w));
   }
   for (int32_t i = 0; i < numFeatures; ++i) {
     if (withKeys) f.inputKeys.push_back("f" + std::to_string(i));
