@@ -546,7 +546,8 @@ size_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::claimChildren(std::vector<Fl
   if (first >= kNodeIndexLimit) {
     throw std::range_error("node index > max size. Use large type for NodeIndexT");
   }
-  // Growing ahead of need keeps adding a split's children to two stores.
+  // The buffer doubles ahead of need, so that most claims are a compare and
+  // an add, and the children's slots are written in place later.
   if (first + 2 > nodes.size()) nodes.resize(2 * nodes.size());
   used = first + 2;
   return first;
