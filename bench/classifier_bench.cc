@@ -16,7 +16,7 @@
 #include "bench/cpu_flags.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
 
 namespace {
 

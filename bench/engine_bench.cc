@@ -29,7 +29,8 @@
 #include "bench/cpu_flags.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
 
 namespace thornvale {
 namespace {

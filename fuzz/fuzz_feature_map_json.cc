@@ -2,7 +2,7 @@
 // Any input must either decode or throw one of the documented errors, and a
 // decoded map must survive being written and read again: equal values, except
 // that integral values of 2^53 or more may be refused on the way back (they
-// are read through a 64-bit integer, as they always were).
+// are read through a 64-bit integer, which must convert to a double exactly).
 #include <cmath>
 #include <cstddef>
 #include <cstdint>

@@ -24,7 +24,7 @@
 #include "host/keystash/testing/TemporaryDirectory.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "reliqaclassifier/testing/TestModels.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/LogCapture.h"
 
 namespace kestrova::reliqaclassifier {
 namespace {

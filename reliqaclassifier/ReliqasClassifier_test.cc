@@ -26,7 +26,7 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMapJson.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/LogCapture.h"
 
 extern char** environ;
 

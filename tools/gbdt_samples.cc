@@ -11,7 +11,8 @@
 #include <string>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
 
 namespace {
 

@@ -8,7 +8,7 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
 
 namespace kestrova::reliqaclassifier::test {
 

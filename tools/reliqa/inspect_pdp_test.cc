@@ -6,7 +6,7 @@
 #include "tools/reliqa/inspect.h"
 #include "tools/reliqa/pdp.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
 
 namespace reliqa::tool {
 namespace {

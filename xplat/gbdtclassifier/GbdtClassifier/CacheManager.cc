@@ -47,9 +47,9 @@ double CacheManager::fetch(const std::string& key, double defaultValue) const {
   return bytes ? textToDouble(*bytes) : defaultValue;
 }
 
-// A JSON object of id -> number. Stored maps that earlier builds wrote read
-// back as they always did, including their quirks: an integral value is read
-// through a 64-bit integer and must be exact (see FeatureMapJson.h).
+// A JSON object of id -> number, its members in any order. An integral value
+// is read through a 64-bit integer and must convert to a double exactly;
+// FeatureMapJson.h has every rule.
 FeatureMap CacheManager::fetch(const std::string& key, const FeatureMap& defaultValue) const {
   std::optional<std::string> bytes = fetchBytes(key);
   return bytes ? featureMapFromJson(*bytes) : defaultValue;

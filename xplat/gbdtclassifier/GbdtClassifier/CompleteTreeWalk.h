@@ -114,94 +114,119 @@ struct CompleteForest {
   }
 };
 
+// The steps of buildCompleteForest(), below.
+namespace detail {
+
+// The trees of one group that the layout takes (bit k for tree first + k) and
+// the depth that they are padded to.
+struct GroupPlan {
+  uint32_t taken;
+  uint32_t depth;
+};
+
+// Takes the trees of [first, end) that `takes` accepts and that are no deeper
+// than kCompleteMaxDepth, then leaves the deepest ones out until the group's
+// padded splits number at most four times the nodes of the trees first taken
+// (or 63 per tree, whichever is more).
+template <typename Tree, typename Takes>
+GroupPlan planGroup(const std::vector<Tree>& trees, size_t first, size_t end, Takes& takes) {
+  uint32_t taken = 0;
+  uint64_t nodes = 0;
+  for (size_t i = first; i < end; ++i) {
+    if (trees[i].depth <= kCompleteMaxDepth && takes(trees[i])) {
+      taken |= uint32_t{1} << (i - first);
+      nodes += trees[i].nodes.size();
+    }
+  }
+  const uint64_t budget = std::max<uint64_t>(4 * nodes, 63 * kCompleteGroup);
+  for (;;) {
+    uint32_t depth = 1;
+    for (size_t i = first; i < end; ++i) {
+      if (taken >> (i - first) & 1) depth = std::max(depth, trees[i].depth);
+    }
+    if (((uint64_t{1} << depth) - 1) * kCompleteGroup <= budget) return GroupPlan{taken, depth};
+    for (size_t i = first; i < end; ++i) {
+      if (trees[i].depth == depth) taken &= ~(uint32_t{1} << (i - first));
+    }
+  }
+}
+
+// Writes `tree` as a complete tree of `depth` levels: its splits into
+// splits[0, 2^depth - 1) in breadth-first order, a root split reading the
+// root keys, and its leaf values into leaves[0, 2^depth), each leaf above the
+// last level filling the run of last-level leaves beneath it. Positions that
+// the tree does not reach keep what they hold (padding splits on the NaN
+// slot).
+template <typename Tree>
+void placeTree(const Tree& tree, int64_t leafId, uint32_t nanSlot, uint32_t depth, CompleteSplit* splits,
+               float* leaves) {
+  const size_t splitCount = (size_t{1} << depth) - 1;
+  // Pairs of (compiled node, complete position), depth first.
+  struct Place {
+    size_t node;
+    size_t at;
+  };
+  Place stack[2 * kCompleteMaxDepth + 2];
+  size_t top = 0;
+  stack[top++] = Place{0, 0};
+  while (top != 0) {
+    const Place p = stack[--top];
+    const auto& n = tree.nodes[p.node];
+    if (n.featureId == leafId) {
+      size_t lo = p.at, hi = p.at;
+      while (lo < splitCount) {
+        lo = 2 * lo + 1;
+        hi = 2 * hi + 2;
+      }
+      std::fill(leaves + (lo - splitCount), leaves + (hi - splitCount) + 1, n.value);
+      continue;
+    }
+    const auto feature = static_cast<uint32_t>(n.featureId);
+    splits[p.at] = p.at == 0 ? CompleteSplit{nanSlot + 1 + feature, completeRootThresholdKey(n.value)}
+                             : CompleteSplit{feature, completeThresholdKey(n.value)};
+    stack[top++] = Place{static_cast<size_t>(n.child) + 1, 2 * p.at + 2};
+    stack[top++] = Place{static_cast<size_t>(n.child), 2 * p.at + 1};
+  }
+}
+
+}  // namespace detail
+
 // Lays out compiled trees. A Tree has `nodes` (root first, the two children
 // of a split adjacent, each node with `featureId`, `child` (index of its
 // first child) and `value`, a leaf marked by featureId == leafId) and `depth`;
-// `takes(tree)` says whether the walk may take it, and trees deeper than
-// kCompleteMaxDepth are never taken. `nanSlot` is the feature position that
-// always holds NaN, the last of the nanSlot + 1 slots. Padding is bounded: when a group's padded splits would
-// exceed four times the nodes of its trees (or 63 per tree, whichever is
-// more), its deepest trees are left out until they do not. Returns an empty
-// forest when no tree is taken.
+// `takes(tree)` says whether the walk may take it; detail::planGroup() says
+// which trees each group takes and how deep it is. `nanSlot` is the feature
+// position that always holds NaN, the last of the nanSlot + 1 slots. Returns
+// an empty forest when no tree is taken.
 template <typename Tree, typename Takes>
 CompleteForest buildCompleteForest(const std::vector<Tree>& trees, int64_t leafId, uint32_t nanSlot,
                                    Takes takes) {
+  // Plan every group, so that the arrays are made once at their final size.
   CompleteForest out;
-  bool any = false;
   size_t splitTotal = 0, leafTotal = 0;
-  // First each group's trees and depth, then the arrays at their final size
-  // (padding splits read the NaN slot; absent trees have 0 leaves), then the
-  // trees in their places.
+  bool any = false;
   for (size_t first = 0; first < trees.size(); first += kCompleteGroup) {
-    const size_t end = std::min(trees.size(), first + kCompleteGroup);
-    bool taken[kCompleteGroup] = {};
-    uint64_t nodes = 0;
-    for (size_t i = first; i < end; ++i) {
-      if (trees[i].depth <= kCompleteMaxDepth && takes(trees[i])) {
-        taken[i - first] = true;
-        nodes += trees[i].nodes.size();
-      }
-    }
-    const uint64_t budget = std::max<uint64_t>(4 * nodes, 63 * kCompleteGroup);
-    uint32_t depth;
-    for (;;) {
-      depth = 1;
-      for (size_t i = first; i < end; ++i) {
-        if (taken[i - first]) depth = std::max(depth, trees[i].depth);
-      }
-      if (((uint64_t{1} << depth) - 1) * kCompleteGroup <= budget) break;
-      for (size_t i = first; i < end; ++i) {
-        if (taken[i - first] && trees[i].depth == depth) taken[i - first] = false;
-      }
-    }
-    uint32_t mask = 0;
-    for (size_t k = 0; k < kCompleteGroup; ++k) mask |= static_cast<uint32_t>(taken[k]) << k;
-    any = any || mask != 0;
-    out.taken.push_back(mask);
-    out.depths.push_back(depth);
+    const auto plan = detail::planGroup(trees, first, std::min(trees.size(), first + kCompleteGroup), takes);
+    any = any || plan.taken != 0;
+    out.taken.push_back(plan.taken);
+    out.depths.push_back(plan.depth);
     out.splitStart.push_back(splitTotal);
     out.leafStart.push_back(leafTotal);
-    splitTotal += kCompleteGroup * ((size_t{1} << depth) - 1);
-    leafTotal += kCompleteGroup * (size_t{1} << depth);
+    splitTotal += kCompleteGroup * ((size_t{1} << plan.depth) - 1);
+    leafTotal += kCompleteGroup * (size_t{1} << plan.depth);
   }
   if (!any) return CompleteForest{};
+
+  // Padding splits read the NaN slot; lanes without a tree have leaves of 0.
   out.splits.assign(splitTotal, CompleteSplit{nanSlot, 0});
   out.leaves.assign(leafTotal, 0.0f);
   for (size_t g = 0; g < out.depths.size(); ++g) {
-    const size_t splitCount = (size_t{1} << out.depths[g]) - 1;
-    const size_t leafCount = size_t{1} << out.depths[g];
-    const size_t first = g * kCompleteGroup;
-    for (size_t i = first; i < std::min(trees.size(), first + kCompleteGroup); ++i) {
-      if ((out.taken[g] >> (i - first) & 1) == 0) continue;
-      CompleteSplit* splits = out.splits.data() + out.splitStart[g] + (i - first) * splitCount;
-      float* leaves = out.leaves.data() + out.leafStart[g] + (i - first) * leafCount;
-      // Pairs of (compiled node, complete position), depth first.
-      struct Place {
-        size_t node;
-        size_t at;
-      };
-      Place stack[2 * kCompleteMaxDepth + 2];
-      size_t top = 0;
-      stack[top++] = Place{0, 0};
-      while (top != 0) {
-        const Place p = stack[--top];
-        const auto& n = trees[i].nodes[p.node];
-        if (n.featureId == leafId) {
-          // The leaves under position p.at are a run of the last level.
-          size_t lo = p.at, hi = p.at;
-          while (lo < splitCount) {
-            lo = 2 * lo + 1;
-            hi = 2 * hi + 2;
-          }
-          std::fill(leaves + (lo - splitCount), leaves + (hi - splitCount) + 1, n.value);
-          continue;
-        }
-        const auto feature = static_cast<uint32_t>(n.featureId);
-        splits[p.at] = p.at == 0 ? CompleteSplit{nanSlot + 1 + feature, completeRootThresholdKey(n.value)}
-                                 : CompleteSplit{feature, completeThresholdKey(n.value)};
-        stack[top++] = Place{static_cast<size_t>(n.child) + 1, 2 * p.at + 2};
-        stack[top++] = Place{static_cast<size_t>(n.child), 2 * p.at + 1};
-      }
+    const uint32_t depth = out.depths[g];
+    for (size_t k = 0; k < kCompleteGroup; ++k) {
+      if ((out.taken[g] >> k & 1) == 0) continue;
+      detail::placeTree(trees[g * kCompleteGroup + k], leafId, nanSlot, depth,
+                        out.splits.data() + out.splitStart[g] + k * ((size_t{1} << depth) - 1),
+                        out.leaves.data() + out.leafStart[g] + k * (size_t{1} << depth));
     }
   }
   return out;

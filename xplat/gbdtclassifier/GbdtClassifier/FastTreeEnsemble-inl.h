@@ -1,53 +1,27 @@
-// Compiled forests: a Forest laid out flat for fast scoring.
+// FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>: the compiled forest behind
+// the interface of FastTreeEnsemble.h, which says what it computes and
+// throws. Included by the code that creates one (BoostingModel.cc) and by the
+// tests and benchmarks that look inside.
 //
-// FastTreeEnsemble<float> is the interface; FastTreeEnsembleOOP<FeatureIdT,
-// NodeIndexT> implements it, as the 16-bit forest <short, unsigned int> and
-// the 32-bit forest <int, unsigned int>. init() compiles a Forest once: each
-// tree becomes one array of 12-byte nodes whose two children are adjacent,
-// leaf values carry the tree weight (float(double(value) * weight)), trees of
-// weight zero (+0 or -0) are dropped, and an optional selector tree picks per
-// input which consecutive range of trees (a sub-model) is summed.
-//
-// Scoring: sum = baseScore (double), plus each selected tree's leaf value
-// widened to double, in tree order; score() is 1 / (exp(-sum) + 1). Features
-// and thresholds are compared as floats. A plain tree (and the selector) goes
-// to the second child at the root unless x <= t, and below the root when
-// x > t, so NaN goes second at the root and first deeper down. A tree that
-// tests an equality feature is walked with x != t (second child) at equality
-// splits and x > t at the others, the root included. unnormalizedScore()
-// walks many trees at once so that their memory loads overlap, yet adds the
-// leaves in tree order, so it is bit-identical to unnormalizedScoreOneByOne().
-// It walks the plain trees over a second copy of them, laid out by init() for
-// the kernel in use. Where the CPU has AVX-512, kWalkGroup trees per call of
-// the vector kernel (FastTreeEnsembleSimd.h), 8 bytes per node, 16 more per
-// tree that is a single leaf, and 16 bytes per tree; trees deeper than
-// kMaxGatherDepth or with more than kWalkMaxDistance nodes are not copied.
-// Elsewhere, kCompleteGroup trees per call of the scalar walk of complete
-// trees (CompleteTreeWalk.h), every tree padded to its group's depth:
-// 8 bytes per split and 4 per leaf of the padded trees; trees deeper than
+// Each tree becomes one array of 12-byte nodes whose two children are
+// adjacent. unnormalizedScore() walks many trees at once so that their memory
+// loads overlap, yet adds the leaves in tree order, so it is bit-identical to
+// unnormalizedScoreOneByOne(). It walks the plain trees over a second copy of
+// them, laid out by init() for the kernel in use (WalkKernel.h). Where the
+// CPU has AVX-512, kWalkGroup trees per call of the vector kernel
+// (FastTreeEnsembleSimd.h), 8 bytes per node, 16 more per tree that is a
+// single leaf, and 16 bytes per tree; trees deeper than kMaxGatherDepth or
+// with more than kWalkMaxDistance nodes are not copied. Elsewhere,
+// kCompleteGroup trees per call of the scalar walk of complete trees
+// (CompleteTreeWalk.h), every tree padded to its group's depth: 8 bytes per
+// split and 4 per leaf of the padded trees; trees deeper than
 // kCompleteMaxDepth are not copied. Without a copy, or when a test asks for
 // WalkKernel::kPortable, it walks 8 compiled trees in lock step. Trees with
 // equality features, trees not copied, and forests reading more than
 // kMaxGatherFeatures positions take the walks of the compiled trees.
 //
-// Errors: init() returns false for a null forest and (after an ERROR log) for
-// a decreasing modelIndexMap; it throws std::range_error when a split's
-// feature id passes the type's limit ("feature id > max size. Use large type
-// for FeatureIdT"), when a child index would not fit ("node index > max
-// size. Use large type for NodeIndexT"), and, when featureMapping is not
-// empty, for a split position outside [0, featureMapping.size()) or an
-// equality feature at or beyond the largest featureMapping entry plus one.
-// With an empty featureMapping every position is accepted (up to the limit;
-// a negative one is kept as position 0) and unnormalizedScoreOfZeros() gives
-// the one score such a model can have. It throws std::runtime_error for a
-// tree with an absent node. Scoring a vector shorter than
-// requiredFeatures() throws std::invalid_argument.
-//
-// Remapping (init with remap = true) translates each split position through
-// featureMapping; the vector is then indexed by feature id, and the equality
-// mask holds bits up to the largest equality feature id.
-//
-// Threads: init() once, then any number of threads may score concurrently.
+// Threads: init() once, then any number of threads may score concurrently;
+// useWalkKernel() is part of setting up, like init().
 #pragma once
 
 #include <glog/logging.h>
@@ -66,36 +40,11 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/CompleteTreeWalk.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsembleSimd.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/WalkKernel.h"
 
 namespace thornvale {
-
-// The logistic of a raw score, as every score of the engine computes it.
-inline double logistic(double rawScore) { return 1.0 / (std::exp(-rawScore) + 1.0); }
-
-template <typename FeatureT>
-class FastTreeEnsemble {
- public:
-  FastTreeEnsemble() = default;
-  FastTreeEnsemble(const FastTreeEnsemble&) = delete;
-  FastTreeEnsemble& operator=(const FastTreeEnsemble&) = delete;
-
-  virtual bool init(const Forest* forest, bool remap) = 0;
-  virtual double unnormalizedScore(const std::vector<FeatureT>& features) const = 0;
-  virtual double score(const std::vector<FeatureT>& features) const = 0;
-  virtual ~FastTreeEnsemble() = default;
-
-  // The same sum as unnormalizedScore(), walking one tree after another.
-  virtual double unnormalizedScoreOneByOne(const std::vector<FeatureT>& features) const = 0;
-  // The raw score when every feature position reads 0.0.
-  virtual double unnormalizedScoreOfZeros() const = 0;
-  // Compiled trees (those of non-zero weight).
-  virtual size_t numTrees() const = 0;
-  // Smallest vector length that scoring accepts: the largest split position + 1.
-  virtual size_t requiredFeatures() const = 0;
-  // 16 or 32: the width of a compiled feature id.
-  virtual int featureIdBits() const = 0;
-};
 
 template <typename FeatureIdT, typename NodeIndexT>
 class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
@@ -224,6 +173,10 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
 
   void buildEqualityMask(const Forest& forest, bool remap);
+  // The feature position that `split` of `tree` reads: its pivotIndex, or the
+  // featureMapping entry it names when remapping. Throws std::range_error
+  // past the limit of FeatureIdT or outside the feature vector.
+  int32_t splitPosition(const LinearNode& split, size_t tree) const;
   // The position that a split on `featureId` reads.
   int32_t checkedPosition(int32_t featureId, size_t tree) const {
     // Without a featureMapping every position reads 0.0; a negative one is
@@ -242,6 +195,10 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     std::vector<FlatNode> nodes;
   };
   void compileTree(const Node& root, double scale, FlatTree& out, size_t tree, CompileScratch& scratch);
+  // Claims the two slots of a split's children at the end of nodes[0, used),
+  // growing `nodes` ahead of need; returns the first. Throws std::range_error
+  // when that index cannot be stored.
+  static size_t claimChildren(std::vector<FlatNode>& nodes, size_t& used);
 
   // Selector walk result as a model number: truncation toward zero, NaN and
   // negative values give 0, values beyond the range the largest value.
@@ -567,67 +524,72 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::throwBadPosition(int32_t featu
 }
 
 template <typename FeatureIdT, typename NodeIndexT>
+int32_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::splitPosition(const LinearNode& split, size_t tree) const {
+  int32_t id = split.pivotIndex;
+  if (remap_) {
+    if (id < 0 || static_cast<uint64_t>(id) >= featureMapping_.size()) {
+      throw std::range_error("split in " + label(tree) + " tests feature position " + std::to_string(id) +
+                             ", outside the featureMapping of " + std::to_string(featureMapping_.size()) +
+                             " entries");
+    }
+    id = static_cast<int32_t>(featureMapping_[id]);
+  }
+  if (int64_t{id} > kMaxFeatureId) {
+    throw std::range_error("feature id > max size. Use large type for FeatureIdT");
+  }
+  return checkedPosition(id, tree);
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
+size_t FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::claimChildren(std::vector<FlatNode>& nodes, size_t& used) {
+  const size_t first = used;
+  if (first >= kNodeIndexLimit) {
+    throw std::range_error("node index > max size. Use large type for NodeIndexT");
+  }
+  // The buffer doubles ahead of need, so that most claims are a compare and
+  // an add, and the children's slots are written in place later.
+  if (first + 2 > nodes.size()) nodes.resize(2 * nodes.size());
+  used = first + 2;
+  return first;
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
 void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::compileTree(const Node& root, double scale,
                                                               FlatTree& out, size_t tree,
                                                               CompileScratch& scratch) {
   std::vector<Pending>& pending = scratch.pending;
-  // The buffer grows ahead of need, so that adding a split's children is two
-  // stores and no call; `used` is its part that holds this tree.
-  std::vector<FlatNode>& nodes = scratch.nodes;
+  std::vector<FlatNode>& nodes = scratch.nodes;  // nodes[0, used) hold this tree
   if (nodes.size() < 64) nodes.resize(64);
   size_t used = 1;
   out.hasEqualityFeature = false;
   out.depth = 0;
   out.leafDepth = std::numeric_limits<uint32_t>::max();
   // Depth first: go down each left spine at once, keeping right children for
-  // later, so that left subtrees are laid out before right ones.
+  // later, so that left subtrees are laid out before right ones. A node's slot
+  // is written when the walk reaches it.
   pending.assign(1, Pending{&root, 0, 0});
   while (!pending.empty()) {
     Pending p = pending.back();
     pending.pop_back();
     for (;;) {
-      const Node* node = p.node;
-      if (node == nullptr) {
-        throw std::runtime_error(label(tree) + " has a split without both children");
-      }
+      if (p.node == nullptr) throw std::runtime_error(label(tree) + " has a split without both children");
       out.depth = std::max(out.depth, p.depth);
-      if (node->isLeaf()) {
+      if (p.node->isLeaf()) {
         out.leafDepth = std::min(out.leafDepth, p.depth);
-        nodes[p.slot].featureId = kLeaf;
-        nodes[p.slot].child = 0;
-        nodes[p.slot].value =
-            static_cast<float>(static_cast<const ConstantNode*>(node)->value * scale);
+        const double value = static_cast<const ConstantNode*>(p.node)->value * scale;
+        nodes[p.slot] = FlatNode{kLeaf, 0, static_cast<float>(value)};
         break;
       }
-      const auto& split = *static_cast<const LinearNode*>(node);
-      int32_t id = split.pivotIndex;
-      if (remap_) {
-        if (id < 0 || static_cast<uint64_t>(id) >= featureMapping_.size()) {
-          throw std::range_error("split in " + label(tree) + " tests feature position " +
-                                 std::to_string(id) + ", outside the featureMapping of " +
-                                 std::to_string(featureMapping_.size()) + " entries");
-        }
-        id = static_cast<int32_t>(featureMapping_[id]);
-      }
-      if (int64_t{id} > kMaxFeatureId) {
-        throw std::range_error("feature id > max size. Use large type for FeatureIdT");
-      }
-      const int32_t position = checkedPosition(id, tree);
-      const size_t first = used;
-      if (first >= kNodeIndexLimit) {
-        throw std::range_error("node index > max size. Use large type for NodeIndexT");
-      }
-      if (first + 2 > nodes.size()) nodes.resize(2 * nodes.size());
-      used = first + 2;
-      FlatNode& n = nodes[p.slot];
-      n.featureId = static_cast<FeatureIdT>(position);
-      n.value = static_cast<float>(split.pivotValue);
-      n.child = static_cast<NodeIndexT>(first);
+      const auto& split = *static_cast<const LinearNode*>(p.node);
+      const int32_t position = splitPosition(split, tree);
+      const size_t first = claimChildren(nodes, used);
+      nodes[p.slot] = FlatNode{static_cast<FeatureIdT>(position), static_cast<NodeIndexT>(first),
+                               static_cast<float>(split.pivotValue)};
       if (!out.hasEqualityFeature) out.hasEqualityFeature = isEquality(position);
       requiredFeatures_ = std::max<size_t>(requiredFeatures_, size_t(position) + 1);
-      // The children's slots are written when the walk reaches them. The
-      // work item is written field by field: a whole temporary copied in
-      // would be read back before its parts are stored, which stalls loads.
+      // The right child waits; the walk goes on with the left one. The work
+      // item is written field by field: a whole temporary copied in would be
+      // read back before its parts are stored, which stalls loads.
       const uint32_t below = p.depth == UINT32_MAX ? p.depth : p.depth + 1;
       Pending& right = pending.emplace_back();
       right.node = split.right.get();

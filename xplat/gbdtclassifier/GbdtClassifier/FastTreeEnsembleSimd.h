@@ -1,6 +1,8 @@
 // The vector kernel that walks a group of compiled trees at once, in lock
 // step, the format of the nodes it walks, and buildWalkForest(), which lays
-// compiled trees out in that format; and the choice among all walk kernels.
+// compiled trees out in that format. The choice among all walk kernels is
+// WalkKernel.h's; walkKernelSupported() and bestWalkKernel() are defined in
+// FastTreeEnsembleSimd.cc, beside the CPU test they need.
 //
 // The trees to walk live in one array of 8-byte WalkNode, so that a single
 // gather base serves every lane and one 64-bit load brings a whole node; a
@@ -33,6 +35,8 @@
 #include <limits>
 #include <vector>
 
+#include "xplat/gbdtclassifier/GbdtClassifier/WalkKernel.h"
+
 namespace thornvale {
 
 struct WalkNode {
@@ -51,12 +55,6 @@ constexpr uint32_t kWalkMaxDistance = (1u << (32 - kWalkFeatureBits)) - 1;
 constexpr WalkNode walkNode(uint32_t feature, uint32_t distance, float value) {
   return WalkNode{feature | (distance << kWalkFeatureBits), value};
 }
-
-enum class WalkKernel {
-  kPortable,  // no walk nodes: 8 compiled trees in lock step (any CPU)
-  kScalar,    // walkComplete() over complete trees (any CPU)
-  kAvx512,    // walkGroup() with 16 lanes per vector
-};
 
 // Trees walked per call of walkGroup().
 constexpr size_t kWalkGroup = 128;
@@ -129,11 +127,6 @@ WalkForest buildWalkForest(const std::vector<Tree>& trees, int64_t leafId, uint3
   for (uint32_t root : out.roots) out.rootNodes.push_back(nodes[root]);
   return out;
 }
-
-// Whether this CPU (and build) can run `kernel`.
-bool walkKernelSupported(WalkKernel kernel);
-// The fastest kernel this CPU can run.
-WalkKernel bestWalkKernel();
 
 // Walks kWalkGroup trees from `roots` (node indices; `rootNodes` holds copies
 // of those nodes) for `rounds` >= 1 steps and stores their leaf values in

@@ -8,9 +8,13 @@
 #include <random>
 #include <set>
 #include <tuple>
+#include <utility>
+#include <vector>
 
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/ForestComparison.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/LogCapture.h"
 
 namespace thornvale {
 namespace {
@@ -42,8 +46,17 @@ Forest mapped(size_t positions) {
 }
 
 // The scoring rules applied straight to the node objects, one tree after
-// another, for comparison with the compiled forests.
-double referenceRaw(const Forest& f, const std::vector<float>& x) {
+// another, for comparison with the compiled forests. It walks the nodes
+// itself: Node::evaluate() and findLeaf() send NaN right at every level,
+// whereas the compiled plain walk sends it right only at the root and left
+// below it.
+//
+// Sub-models are not derived from modelIndexMap here: `models[m]` is the range
+// [first, end) of kept trees (those of non-zero weight) that model number m
+// sums, written out by the caller, and the selector's leaf value, truncated,
+// picks m.
+using Ranges = std::vector<std::pair<size_t, size_t>>;
+double referenceRaw(const Forest& f, const std::vector<float>& x, const Ranges& models = {}) {
   std::set<int32_t> eq;
   if (!f.featureMapping.empty()) eq.insert(f.equalityFeatures.begin(), f.equalityFeatures.end());
   auto walk = [&](const Node* n, bool equalityWalk) {
@@ -81,10 +94,7 @@ double referenceRaw(const Forest& f, const std::vector<float>& x) {
   size_t first = 0, end = kept.size();
   if (f.modelSelector.tree && f.modelSelector.weight != 0.0) {
     const float v = static_cast<float>(walk(f.modelSelector.tree->root.get(), false));
-    uint64_t m = std::isnan(v) || v < 0 ? 0 : v >= 4294967296.0f ? 4294967295u : uint64_t(v);
-    m = std::min<uint64_t>(m, f.modelIndexMap.size());
-    if (m > 0) first = std::min<size_t>(f.modelIndexMap[m - 1], kept.size());
-    if (m < f.modelIndexMap.size()) end = std::min<size_t>(f.modelIndexMap[m], kept.size());
+    std::tie(first, end) = models.at(static_cast<size_t>(v));
   }
   double sum = f.baseScore;
   for (size_t i = first; i < end; ++i) {
@@ -292,9 +302,13 @@ void checkAgainstReference(uint64_t seed) {
   std::mt19937_64 rng(seed);
   for (int round = 0; round < 12; ++round) {
     const size_t count = 1 + rng() % 40;
-    Forest f = test::randomForest(rng(), count, 1 + static_cast<int>(rng() % 6), 10);
+    const int depth = 1 + static_cast<int>(rng() % 6);  // drawn apart: argument order varies
+    Forest f = test::randomForest(rng(), count, depth, 10);
     f.trees[rng() % count].weight = 0.0;
     if (round % 3 != 0) f.equalityFeatures = {static_cast<uint32_t>(rng() % 10)};
+    // The trees that the compiled forest keeps: all but the one of weight 0.
+    const size_t kept = count - 1;
+    Ranges models;
     if (round % 2 == 1) {
       f.modelSelector = weighted(test::randomFullTree(rng, 2, 10), 1);
       std::vector<Node*> pending{f.modelSelector.tree->root.get()};
@@ -308,7 +322,10 @@ void checkAgainstReference(uint64_t seed) {
           pending.push_back(static_cast<LinearNode*>(n)->right.get());
         }
       }
-      f.modelIndexMap = {static_cast<uint32_t>(count / 3), static_cast<uint32_t>(count / 2)};
+      const size_t a = count / 3, b = count / 2;  // both at most `kept`
+      f.modelIndexMap = {static_cast<uint32_t>(a), static_cast<uint32_t>(b)};
+      // Model 3 lies past the last boundary: it sums the last model's trees.
+      models = {{0, a}, {a, b}, {b, kept}, {b, kept}};
     }
     auto e = compiled<E>(f);
     std::uniform_real_distribution<float> u(-1.2f, 1.2f);
@@ -322,13 +339,13 @@ void checkAgainstReference(uint64_t seed) {
         const auto* root = static_cast<const LinearNode*>(f.trees[0].tree->root.get());
         if (!root->isLeaf()) x[root->pivotIndex] = static_cast<float>(root->pivotValue);
       }
-      const double expected = referenceRaw(f, x);
+      const double expected = referenceRaw(f, x, models);
       ASSERT_TRUE(test::sameBits(e->unnormalizedScore(x), expected)) << round << "/" << v;
       ASSERT_TRUE(test::sameBits(e->unnormalizedScoreOneByOne(x), expected)) << round;
       ASSERT_TRUE(test::sameBits(e->score(x), logistic(expected)));
     }
     const std::vector<float> zeros(10, 0.0f);
-    EXPECT_TRUE(test::sameBits(e->unnormalizedScoreOfZeros(), referenceRaw(f, zeros)));
+    EXPECT_TRUE(test::sameBits(e->unnormalizedScoreOfZeros(), referenceRaw(f, zeros, models)));
   }
 }
 
@@ -349,8 +366,8 @@ void checkKernels(uint64_t seed, int32_t numFeatures) {
   std::mt19937_64 rng(seed);
   for (int round = 0; round < 6; ++round) {
     const size_t count = 1 + rng() % (2 * kWalkGroup + 20);
-    Forest f = test::randomForest(rng(), count, 1 + static_cast<int>(rng() % 10), numFeatures,
-                                     false, round % 2 ? 0.3 : 0.0);
+    const int depth = 1 + static_cast<int>(rng() % 10);  // drawn apart: argument order varies
+    Forest f = test::randomForest(rng(), count, depth, numFeatures, false, round % 2 ? 0.3 : 0.0);
     for (size_t i = 0; i < count; i += 1 + rng() % 16) {
       switch (rng() % 4) {
         case 0: f.trees[i].tree->root = leaf(0.25 * static_cast<double>(i)); break;

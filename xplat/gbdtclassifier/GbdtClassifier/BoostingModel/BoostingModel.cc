@@ -6,6 +6,8 @@
 #include <sstream>
 #include <string_view>
 
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
+
 namespace thornvale {
 
 namespace {

@@ -24,6 +24,10 @@
 // pointers, but no node may be taken out of it (it would not outlive the
 // model) or put into it (it would never be freed). Immutable after
 // construction: predict() and rawScore() may run on several threads at once.
+//
+// The compiled forest is seen through its interface (FastTreeEnsemble.h);
+// its implementation (FastTreeEnsemble-inl.h) is compiled in
+// BoostingModel.cc alone.
 #pragma once
 
 #include <cstddef>
@@ -33,15 +37,17 @@
 #include <unordered_map>
 #include <vector>
 
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/NodeArena.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMap.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/WalkKernel.h"
 
 namespace thornvale {
 
 class BoostingModel {
  public:
-  // The compiled forest scores with `kernel` (FastTreeEnsembleOOP).
+  // The compiled forest scores with `kernel`.
   explicit BoostingModel(const std::string& serializedModel, WalkKernel kernel = bestWalkKernel());
   ~BoostingModel();
   BoostingModel(const BoostingModel&) = delete;

@@ -8,9 +8,11 @@
 #include <thread>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/SmallStack.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/StdoutCapture.h"
 
 namespace thornvale {
 namespace {

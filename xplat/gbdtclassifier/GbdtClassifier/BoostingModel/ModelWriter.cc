@@ -1,9 +1,10 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 
-#include <cstring>
 #include <stdexcept>
 #include <utility>
 #include <vector>
+
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/LittleEndian.h"
 
 namespace thornvale {
 
@@ -14,10 +15,7 @@ class Record {
  public:
   template <typename T>
   Record& put(T value) {
-    static_assert(sizeof(T) == 4 || sizeof(T) == 8);
-    uint64_t bits = 0;
-    std::memcpy(&bits, &value, sizeof(T));
-    for (size_t i = 0; i < sizeof(T); ++i) bytes_.push_back(static_cast<char>(bits >> (8 * i)));
+    appendLittleEndian(bytes_, value);
     return *this;
   }
   Record& tag(uint8_t t) {

@@ -7,8 +7,10 @@
 #include <cstring>
 #include <limits>
 
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/ForestComparison.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/StdoutCapture.h"
 
 namespace thornvale {
 namespace {

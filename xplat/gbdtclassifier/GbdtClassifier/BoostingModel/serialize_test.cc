@@ -3,13 +3,14 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <cstring>
 #include <sstream>
 
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/LittleEndian.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/LogCapture.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/ForestComparison.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/LogCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/StdoutCapture.h"
 
 namespace thornvale {
 namespace {
@@ -18,14 +19,12 @@ using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using test::LogCapture;
 
-// Little-endian record builder for hand-made model lines.
+// Record builder for hand-made model lines, little-endian like the format.
 struct Bytes {
   std::string b;
   template <typename T>
   Bytes& put(T v) {
-    char raw[sizeof(T)];
-    std::memcpy(raw, &v, sizeof(T));
-    b.append(raw, sizeof(T));
+    appendLittleEndian(b, v);
     return *this;
   }
   Bytes& i32(int32_t v) { return put(v); }

@@ -68,61 +68,109 @@ void writeIndent(std::ostream& out, int32_t depth) {
   for (int32_t i = 0; i < depth; ++i) out << '\t';
 }
 
-// Bounds of one feature on a rule, as printed.
-struct RuleBounds {
-  bool hasLower = false;
-  bool hasUpper = false;
-  double lower = 0.0;
-  double upper = 0.0;
-};
-
-void writeRuleEntry(std::ostream& out, const Tree* tree, int32_t index,
-                    const RuleBounds& b) {
-  if (b.hasLower) {
-    out << b.lower << " < ";
-    writeName(out, tree, index);
-    if (b.hasUpper) out << " <= " << b.upper;
-    out << "; ";
-  } else if (b.hasUpper) {
-    writeName(out, tree, index);
-    out << " <= " << b.upper << "; ";
-  }
-}
-
-// One bound of a feature while a depth-first walk descends: pivots arrive from
-// the top down, yet the bound must equal the bottom-up fold of the leaf's
-// parent walk (std::max for lower bounds, std::min for upper). That fold keeps
-// its first (deepest) value on ties and when the deepest value is NaN, and
-// otherwise ignores NaN, so it is the deepest value when that is NaN and
-// else the extreme non-NaN value, the deepest winning ties (+0 versus -0).
-struct DescentBound {
-  bool set = false;
-  bool haveBest = false;
-  double deepest = 0.0;
-  double best = 0.0;
-
-  void addDeeper(double v, bool lower) {
-    set = true;
-    deepest = v;
-    if (std::isnan(v)) return;
-    if (!haveBest || (lower ? v >= best : v <= best)) {
-      best = v;
-      haveBest = true;
+// One bound of one feature on a rule. A rule defines it from the leaf upwards:
+// the deepest pivot, then std::max (lower bound) or std::min (upper bound) of
+// it and each pivot above. Those keep what they hold on a tie and when either
+// side is NaN, so the bound is the deepest pivot when that is NaN, and
+// otherwise the extreme of the pivots that are not NaN, the deepest of equal
+// ones winning (+0 against -0). Pivots are added here from the top down.
+class Bound {
+ public:
+  void addDeeper(double pivot, bool lower) {
+    set_ = true;
+    deepest_ = pivot;
+    if (std::isnan(pivot)) return;
+    if (!haveBest_ || (lower ? pivot >= best_ : pivot <= best_)) {
+      best_ = pivot;
+      haveBest_ = true;
     }
   }
-  double resolved() const { return std::isnan(deepest) ? deepest : best; }
+  bool isSet() const { return set_; }
+  double value() const { return std::isnan(deepest_) ? deepest_ : best_; }
+
+ private:
+  bool set_ = false;
+  bool haveBest_ = false;
+  double deepest_ = 0.0;
+  double best_ = 0.0;
 };
 
-struct DescentBounds {
-  DescentBound lower, upper;
-  RuleBounds resolved() const {
-    RuleBounds r;
-    r.hasLower = lower.set;
-    r.hasUpper = upper.set;
-    if (lower.set) r.lower = lower.resolved();
-    if (upper.set) r.upper = upper.resolved();
-    return r;
+// The bounds that the splits on the way down to a node put on each feature,
+// for the rule lines of the leaves. descend() adds the next split down;
+// ascendTo() takes splits back off the bottom, so that one depth-first walk
+// serves every leaf of a subtree.
+class RulePath {
+ public:
+  // The way from the root down to `node`, by its parent links.
+  static RulePath downTo(const Node& node) {
+    std::vector<std::pair<const LinearNode*, bool>> up;  // parent, and whether `node` is on its right
+    for (const Node *child = &node, *p = node.parent; p != nullptr; child = p, p = p->parent) {
+      const LinearNode& split = asSplit(*p);
+      up.emplace_back(&split, split.right.get() == child);
+    }
+    RulePath path;
+    for (auto it = up.rbegin(); it != up.rend(); ++it) path.descend(*it->first, it->second);
+    return path;
   }
+
+  size_t depth() const { return undo_.size(); }
+
+  void descend(const LinearNode& split, bool right) {
+    auto found = bounds_.find(split.pivotIndex);
+    if (found == bounds_.end()) {
+      undo_.push_back({split.pivotIndex, false, {}});
+      found = bounds_.emplace(split.pivotIndex, Bounds{}).first;
+    } else {
+      undo_.push_back({split.pivotIndex, true, found->second});
+    }
+    if (right) {
+      found->second.lower.addDeeper(split.pivotValue, true);
+    } else {
+      found->second.upper.addDeeper(split.pivotValue, false);
+    }
+  }
+
+  void ascendTo(size_t depth) {
+    for (; undo_.size() > depth; undo_.pop_back()) {
+      const Undo& u = undo_.back();
+      if (u.existed) {
+        bounds_[u.index] = u.saved;
+      } else {
+        bounds_.erase(u.index);
+      }
+    }
+  }
+
+  // The rule line of `leaf`, without its end: the value, a tab, then for each
+  // feature in ascending index order "lower < name <= upper; ", leaving out
+  // a bound that no split set.
+  void writeRule(std::ostream& out, const ConstantNode& leaf) const {
+    out << leaf.value << "\t";
+    for (const auto& [index, b] : bounds_) {
+      if (b.lower.isSet()) {
+        out << b.lower.value() << " < ";
+        writeName(out, leaf.tree, index);
+        if (b.upper.isSet()) out << " <= " << b.upper.value();
+        out << "; ";
+      } else {
+        writeName(out, leaf.tree, index);
+        out << " <= " << b.upper.value() << "; ";
+      }
+    }
+  }
+
+ private:
+  struct Bounds {
+    Bound lower, upper;
+  };
+  // What descend() changed: the feature's bounds before it, if it had any.
+  struct Undo {
+    int32_t index;
+    bool existed;
+    Bounds saved;
+  };
+  std::map<int32_t, Bounds> bounds_;
+  std::vector<Undo> undo_;
 };
 
 // Sorts leaf positions so that larger leaf values come first. NaN values go
@@ -173,22 +221,7 @@ void ConstantNode::printTree(std::ostream& out, int32_t depth) const {
 }
 
 void ConstantNode::printRules(std::ostream& out) const {
-  // Fold the pivots met on the way up, deepest first.
-  std::map<int32_t, RuleBounds> bounds;
-  const Node* child = this;
-  for (const Node* p = parent; p != nullptr; child = p, p = p->parent) {
-    const LinearNode& split = asSplit(*p);
-    RuleBounds& b = bounds[split.pivotIndex];
-    if (split.right.get() == child) {
-      b.lower = b.hasLower ? std::max(b.lower, split.pivotValue) : split.pivotValue;
-      b.hasLower = true;
-    } else {
-      b.upper = b.hasUpper ? std::min(b.upper, split.pivotValue) : split.pivotValue;
-      b.hasUpper = true;
-    }
-  }
-  out << value << "\t";
-  for (const auto& [index, b] : bounds) writeRuleEntry(out, tree, index, b);
+  RulePath::downTo(*this).writeRule(out, *this);
   out << std::endl;
 }
 
@@ -300,26 +333,10 @@ void LinearNode::printTree(std::ostream& out, int32_t depth) const {
 }
 
 void LinearNode::printRules(std::ostream& out) const {
-  // One depth-first walk formats every leaf's rule into a buffer, keeping the
-  // bounds of the current path; leaves are then written in order of value.
-  std::map<int32_t, DescentBounds> bounds;
-
-  auto addBound = [&bounds](const LinearNode& split, bool wentRight) {
-    DescentBounds& b = bounds[split.pivotIndex];
-    if (wentRight) {
-      b.lower.addDeeper(split.pivotValue, true);
-    } else {
-      b.upper.addDeeper(split.pivotValue, false);
-    }
-  };
-
-  // Splits above this one bound every leaf below it; apply them top-down.
-  std::vector<std::pair<const LinearNode*, bool>> above;
-  for (const Node *child = this, *p = parent; p != nullptr; child = p, p = p->parent) {
-    const LinearNode& split = asSplit(*p);
-    above.emplace_back(&split, split.right.get() == child);
-  }
-  for (auto it = above.rbegin(); it != above.rend(); ++it) addBound(*it->first, it->second);
+  // One depth-first walk formats every leaf's rule into a buffer; leaves are
+  // then written in order of value. The splits above this one bound every
+  // leaf below it.
+  RulePath path = RulePath::downTo(*this);
 
   std::ostringstream text;
   text.flags(out.flags());
@@ -330,45 +347,30 @@ void LinearNode::printRules(std::ostream& out) const {
   std::vector<const Node*> leaves;
   std::vector<size_t> lineStart;
 
-  struct Step {
+  // A node to visit: the path's depth at the split above it, that split (none
+  // for this node) and the side of it that the node is on.
+  struct Visit {
     const Node* node;
-    int stage;  // splits: 0 go left, 1 go right, 2 done
-    bool existed;
-    DescentBounds saved;
+    size_t depth;
+    const LinearNode* above;
+    bool right;
   };
-  std::vector<Step> pending{{this, 0, false, {}}};
+  std::vector<Visit> pending{{this, path.depth(), nullptr, false}};
   while (!pending.empty()) {
-    Step& s = pending.back();
-    if (s.node->isLeaf()) {
-      leaves.push_back(s.node);
+    const Visit v = pending.back();
+    pending.pop_back();
+    path.ascendTo(v.depth);
+    if (v.above != nullptr) path.descend(*v.above, v.right);
+    if (v.node->isLeaf()) {
+      leaves.push_back(v.node);
       lineStart.push_back(static_cast<size_t>(text.tellp()));
-      text << asLeaf(*s.node).value << "\t";
-      for (const auto& [index, b] : bounds) {
-        writeRuleEntry(text, s.node->tree, index, b.resolved());
-      }
+      path.writeRule(text, asLeaf(*v.node));
       text << '\n';
-      pending.pop_back();
       continue;
     }
-    const LinearNode& split = asSplit(*s.node);
-    if (s.stage == 0) {
-      auto found = bounds.find(split.pivotIndex);
-      s.existed = found != bounds.end();
-      if (s.existed) s.saved = found->second;
-    } else if (s.existed) {
-      bounds[split.pivotIndex] = s.saved;
-    } else {
-      bounds.erase(split.pivotIndex);
-    }
-    if (s.stage == 2) {
-      pending.pop_back();
-      continue;
-    }
-    const bool right = s.stage == 1;
-    ++s.stage;
-    addBound(split, right);
-    const Node* next = right ? split.right.get() : split.left.get();
-    if (next != nullptr) pending.push_back({next, 0, false, {}});  // invalidates `s`
+    const LinearNode& split = asSplit(*v.node);
+    if (split.right) pending.push_back({split.right.get(), path.depth(), &split, true});
+    if (split.left) pending.push_back({split.left.get(), path.depth(), &split, false});
   }
 
   const std::string all = text.str();

@@ -6,6 +6,12 @@
 // otherwise (greater, or NaN on either side); a ConstantNode (leaf) holds the
 // tree's output. A LinearNode owns both children, a Tree owns its root.
 //
+// NaN goes right at every split, the root and every level below it. The
+// compiled forests (FastTreeEnsemble-inl.h) differ on purpose: their plain
+// walk sends NaN right at the root but left below it. So evaluate() and
+// findLeaf() are no reference for a compiled forest wherever a feature or a
+// threshold is NaN.
+//
 // Nodes are immutable once built; every const operation may run on several
 // threads at once. No operation recurses once per tree level: evaluation, the
 // sweep, clone, the printers, leaf collection, linking and destruction all use

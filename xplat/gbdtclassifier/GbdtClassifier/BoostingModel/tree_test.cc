@@ -7,8 +7,11 @@
 #include <random>
 #include <sstream>
 
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/StdoutCapture.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/ForestComparison.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/TreeBuilders.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/SmallStack.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/testing/StdoutCapture.h"
 
 namespace thornvale {
 namespace {
@@ -128,6 +131,37 @@ TEST(TreePrinting, RulesOrderedByValueWithAllBoundForms) {
       split(0, 4.0, split(0, 2.0, leaf(1), leaf(2)), split(1, -0.5, leaf(3), leaf(4))));
   linkTree(*u, {});
   EXPECT_EQ(rules(*u->root), "4\t4 < 0; -0.5 < 1; \n3\t4 < 0; 1 <= -0.5; \n2\t2 < 0 <= 4; \n1\t0 <= 2; \n");
+}
+
+// A rule's bound is folded from the leaf upwards with std::max (lower) and
+// std::min (upper): the deeper pivot wins a tie of +0 and -0, and a NaN pivot
+// counts only when it is the deepest on its feature.
+TEST(TreePrinting, RuleBoundsOfSignedZeroAndNaNPivots) {
+  auto printed = [](std::unique_ptr<Node> root) {
+    auto t = test::tree(std::move(root));
+    linkTree(*t, {"x", "y"});
+    return rules(*t->root);
+  };
+  EXPECT_EQ(printed(split(0, -0.0, split(0, 0.0, leaf(1), leaf(2)), split(0, 0.0, leaf(3), leaf(4)))),
+            "4\t0 < x; \n"
+            "3\t-0 < x <= 0; \n"
+            "2\t0 < x <= -0; \n"
+            "1\tx <= 0; \n");
+  EXPECT_EQ(printed(split(0, 0.0, split(0, -0.0, leaf(1), leaf(2)), split(0, -0.0, leaf(3), leaf(4)))),
+            "4\t-0 < x; \n"
+            "3\t0 < x <= -0; \n"
+            "2\t-0 < x <= 0; \n"
+            "1\tx <= -0; \n");
+  EXPECT_EQ(printed(split(1, kNaN, split(1, 1.0, leaf(5), leaf(6)), split(1, 2.0, leaf(7), leaf(8)))),
+            "8\t2 < y; \n"
+            "7\tnan < y <= 2; \n"
+            "6\t1 < y <= nan; \n"
+            "5\ty <= 1; \n");
+  EXPECT_EQ(printed(split(1, 1.0, split(1, kNaN, leaf(9), leaf(10)), split(1, kNaN, leaf(11), leaf(12)))),
+            "12\tnan < y; \n"
+            "11\t1 < y <= nan; \n"
+            "10\tnan < y <= 1; \n"
+            "9\ty <= nan; \n");
 }
 
 // The root's printRules (one depth-first pass) must write exactly what the
