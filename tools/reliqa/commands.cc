@@ -148,7 +148,7 @@ void setModel(const SetModelOptions& o) {
       // Load it once here: a model that the classifier cannot load must never
       // reach the store, where it would stop every later classifier.
       auto model = loadModel(name, params.mSerializedModel);
-      ModelHeader header = readModelHeader(params.mSerializedModel);
+      thornvale::ModelHeader header = readModelHeader(params.mSerializedModel);
       if (!header.complete || header.magic != thornvale::kModelMagic) {
         warn(name, "the magic number is " + std::to_string(header.magic) + ", not " +
                        std::to_string(thornvale::kModelMagic) + "; stored all the same, as the classifier reads it");

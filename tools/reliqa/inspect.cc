@@ -68,23 +68,15 @@ void row(std::ostringstream& out, const char* label, const std::string& value) {
 
 }  // namespace
 
-// The model reader's own functions, each over the first line: is_header()
-// gives the version (and logs a bad header again), read_int32() the magic.
-ModelHeader readModelHeader(const std::string& modelText) {
-  const std::string firstLine = modelText.substr(0, modelText.find('\n'));
-  std::istringstream forMagic(firstLine);
-  std::istringstream forVersion(firstLine);
-  ModelHeader h;
-  h.complete = thornvale::base64_decode(firstLine).size() >= 8;
-  h.magic = thornvale::read_int32(forMagic);
-  h.version = thornvale::is_header(forVersion);
-  return h;
+thornvale::ModelHeader readModelHeader(const std::string& modelText) {
+  std::istringstream in(modelText);
+  return thornvale::read_header(in);
 }
 
 std::string describeModel(const std::string& name, const std::string& modelText, const Forest& forest,
                           bool sixteenBit) {
   std::ostringstream out;
-  ModelHeader header = readModelHeader(modelText);
+  thornvale::ModelHeader header = readModelHeader(modelText);
   row(out, "model", name + " (" + std::to_string(modelText.size()) + " bytes)");
   std::string format = "version " + std::to_string(header.version);
   if (!thornvale::isReadableVersion(header.version)) format += " (unknown to the reader: the model is empty)";

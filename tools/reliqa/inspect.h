@@ -14,20 +14,12 @@
 #include <cstdint>
 #include <string>
 
-namespace thornvale {
-struct Forest;
-}
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 
 namespace reliqa::tool {
 
-struct ModelHeader {
-  bool complete = false;  // the first line held both numbers
-  int32_t magic = 0;
-  int32_t version = 0;
-};
-
-// The header of a model text, as the model reader reads it.
-ModelHeader readModelHeader(const std::string& modelText);
+// The header of a model text, as the model reader reads it (nothing logged).
+thornvale::ModelHeader readModelHeader(const std::string& modelText);
 
 // `sixteenBit` is the width the engine chose for this forest.
 std::string describeModel(const std::string& name, const std::string& modelText, const thornvale::Forest& forest,

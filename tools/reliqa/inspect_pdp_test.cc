@@ -79,7 +79,7 @@ TEST(Inspect, SummaryCountsTreesAndNamesTheForestWidth) {
   EXPECT_THAT(s, HasSubstr("feature mapping  2: 10, 20"));
   EXPECT_THAT(s, HasSubstr("none: one model of all kept trees"));
   EXPECT_THAT(s, HasSubstr("16-bit forest (2 input keys)"));
-  ModelHeader h = readModelHeader(text);
+  thornvale::ModelHeader h = readModelHeader(text);
   EXPECT_TRUE(h.complete);
   EXPECT_EQ(h.version, 4);
 }

@@ -310,23 +310,30 @@ class Reader {
   NodeArena& arena_;  // every node of the model
 };
 
+// The numbers of a decoded header line, without a word about what is wrong.
+ModelHeader headerOf(const std::string& decoded) {
+  ModelHeader header;
+  header.magic = loadPrefix<int32_t>(decoded);
+  header.version =
+      decoded.size() > 4
+          ? loadPrefix<int32_t>(reinterpret_cast<const unsigned char*>(decoded.data()) + 4, decoded.size() - 4)
+          : 0;
+  header.complete = decoded.size() >= 8;
+  return header;
+}
+
 int32_t parseHeader(const std::string& decoded) {
+  const ModelHeader header = headerOf(decoded);
   if (decoded.size() < 4) {
     LOG(ERROR) << "is_header reached eof or fail bit is set when reading magic number";
   }
-  const auto magic = loadPrefix<int32_t>(decoded);
-  if (magic != kModelMagic) {
-    LOG(ERROR) << "magic number in header does not match! " << magic << " vs " << kModelMagic;
+  if (header.magic != kModelMagic) {
+    LOG(ERROR) << "magic number in header does not match! " << header.magic << " vs " << kModelMagic;
   }
-  const auto version =
-      decoded.size() > 4
-          ? loadPrefix<int32_t>(reinterpret_cast<const unsigned char*>(decoded.data()) + 4,
-                                decoded.size() - 4)
-          : 0;
-  if (decoded.size() < 8) {
+  if (!header.complete) {
     LOG(ERROR) << "is_header reached eof or fail bit is set when reading version number";
   }
-  return version;
+  return header.version;
 }
 
 std::unique_ptr<Forest> Reader::read() {
@@ -463,6 +470,8 @@ int32_t read_int32(std::istream& in) { return loadPrefix<int32_t>(read_base64_li
 double read_double(std::istream& in) { return loadPrefix<double>(read_base64_line(in)); }
 
 int32_t is_header(std::istream& in) { return parseHeader(read_base64_line(in)); }
+
+ModelHeader read_header(std::istream& in) { return headerOf(read_base64_line(in)); }
 
 std::unique_ptr<Node> deserialize_node(std::istream& in) {
   StreamBytes src(in);

@@ -67,6 +67,14 @@ std::unique_ptr<Forest> deserialize(std::string_view text, NodeArena& arena);
 
 // Reads the header line; returns the version. Problems are only logged.
 int32_t is_header(std::istream& in);
+// The numbers of the header line, as is_header reads them, without logging:
+// missing bytes read as zero, and `complete` says whether the line held both.
+struct ModelHeader {
+  int32_t magic = 0;
+  int32_t version = 0;
+  bool complete = false;
+};
+ModelHeader read_header(std::istream& in);
 // Fills `out` from one undecoded tree line: weight, nodes, and for versions
 // above 1 the featureValues table. Throws std::runtime_error on an absent node
 // or an impossible featureValues count.

@@ -4,6 +4,8 @@
 #include <gtest/gtest.h>
 
 #include <sstream>
+#include <string>
+#include <tuple>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/LittleEndian.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
@@ -167,6 +169,19 @@ TEST(Header, VersionsAndMessages) {
               ElementsAre("is_header reached eof or fail bit is set when reading magic number",
                           "magic number in header does not match! 0 vs 314156",
                           "is_header reached eof or fail bit is set when reading version number"));
+
+  // read_header gives the same numbers and says nothing.
+  log.clear();
+  for (const auto& [text, magic, version, complete] :
+       {std::tuple{wrong.text, 12345, 2, true}, std::tuple{std::string("\n"), 0, 0, false},
+        std::tuple{minimalV2().text, 314156, 2, true}}) {
+    std::istringstream in(text);
+    const ModelHeader header = read_header(in);
+    EXPECT_EQ(header.magic, magic);
+    EXPECT_EQ(header.version, version);
+    EXPECT_EQ(header.complete, complete);
+  }
+  EXPECT_TRUE(log.at(google::GLOG_ERROR).empty());
 }
 
 TEST(Layout, OptionalPartsAndEmptyLines) {
