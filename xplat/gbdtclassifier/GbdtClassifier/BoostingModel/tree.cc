@@ -378,7 +378,9 @@ void LinearNode::printRules(std::ostream& out) const {
 
   std::vector<size_t> order(leaves.size());
   std::iota(order.begin(), order.end(), size_t{0});
-  std::sort(order.begin(), order.end(), LeafOrder(leaves));
+  // Stable: leaves of equal value keep their order from left to right, so
+  // that every standard library writes the same lines.
+  std::stable_sort(order.begin(), order.end(), LeafOrder(leaves));
   for (size_t i : order) {
     // Each buffered line ends with '\n'; write it without, then std::endl.
     out.write(all.data() + lineStart[i],

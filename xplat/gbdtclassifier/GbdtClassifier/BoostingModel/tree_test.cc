@@ -133,6 +133,32 @@ TEST(TreePrinting, RulesOrderedByValueWithAllBoundForms) {
   EXPECT_EQ(rules(*u->root), "4\t4 < 0; -0.5 < 1; \n3\t4 < 0; 1 <= -0.5; \n2\t2 < 0 <= 4; \n1\t0 <= 2; \n");
 }
 
+// Leaves of equal value come out from left to right, whatever the standard
+// library's sort would do with ties (64 leaves, past the sizes that are
+// sorted by insertion); NaN values come last.
+TEST(TreePrinting, RulesOfEqualLeavesComeLeftToRight) {
+  std::mt19937_64 rng(5);
+  auto t = test::tree(test::randomFullTree(rng, 6, 2));
+  std::vector<const Node*> leaves;
+  t->root->collectLeaves(leaves);
+  ASSERT_EQ(leaves.size(), 64u);
+  for (size_t i = 0; i < leaves.size(); ++i) {
+    const_cast<ConstantNode*>(static_cast<const ConstantNode*>(leaves[i]))->value = i % 3 == 0 ? 2.0 : 1.0;
+  }
+  linkTree(*t, {"x", "y"});
+  std::ostringstream expected;
+  for (double value : {2.0, 1.0}) {
+    for (const Node* l : leaves) {
+      if (static_cast<const ConstantNode*>(l)->value == value) l->printRules(expected);
+    }
+  }
+  EXPECT_EQ(rules(*t->root), expected.str());
+
+  auto v = test::tree(split(0, 4.0, split(0, 2.0, leaf(kNaN), leaf(1)), split(0, 6.0, leaf(3), leaf(2))));
+  linkTree(*v, {});
+  EXPECT_EQ(rules(*v->root), "3\t4 < 0 <= 6; \n2\t6 < 0; \n1\t2 < 0 <= 4; \nnan\t0 <= 2; \n");
+}
+
 // A rule's bound is folded from the leaf upwards with std::max (lower) and
 // std::min (upper): the deeper pivot wins a tie of +0 and -0, and a NaN pivot
 // counts only when it is the deepest on its feature.
