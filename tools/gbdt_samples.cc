@@ -1,10 +1,10 @@
-// gbdt-samples: writes the sample model of the demonstration and the seed
-// models of the model reader's fuzz target, all made with the model writer.
+// gbdt-samples: writes the seed models of the model reader's fuzz target,
+// made with the model writer.
 //
 //   gbdt-samples REPO_ROOT
 //
-// writes REPO_ROOT/examples/demo/model.txt and
-// REPO_ROOT/fuzz/corpus/model_reader/*.txt. The output is deterministic.
+// writes REPO_ROOT/fuzz/corpus/model_reader/*.txt. The output is
+// deterministic.
 #include <fstream>
 #include <iostream>
 #include <random>
@@ -28,16 +28,6 @@ void save(const std::string& path, const std::string& text) {
   std::cout << path << " (" << text.size() << " bytes)\n";
 }
 
-// Six inputs fed by feature ids 3, 17, 4, 21, 42 and 8; 12 trees of depth 3.
-Forest demoModel() {
-  Forest f = test::randomForest(2024, 12, 3, 6);
-  f.baseScore = -0.4;
-  f.featureMapping = {3, 17, 4, 21, 42, 8};
-  f.inputKeys = {"feature_3", "feature_17", "feature_4", "feature_21", "feature_42", "feature_8"};
-  f.averageFeatureValues = {{3, 0.1}, {17, -0.2}, {4, 0.0}};
-  return f;
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -48,8 +38,6 @@ int main(int argc, char** argv) {
   const std::string root = argv[1];
   const std::string seeds = root + "/fuzz/corpus/model_reader/";
   try {
-    save(root + "/examples/demo/model.txt", writeModel(demoModel(), 4));
-
     // Version 2: no metadata, so a constant-score model.
     Forest v2 = test::randomForest(1, 3, 2, 3);
     v2.featureMapping.clear();
