@@ -11,10 +11,10 @@
 #include <cstdlib>
 #include <string_view>
 
-#include "tools/reliqa/collection_reader.h"
-#include "tools/reliqa/errors.h"
-#include "tools/reliqa/feature_rows.h"
-#include "tools/reliqa/testing/record_difference.h"
+#include "tools/common/collection_reader.h"
+#include "tools/common/errors.h"
+#include "tools/common/feature_rows.h"
+#include "tools/common/testing/record_difference.h"
 
 namespace {
 

@@ -12,8 +12,8 @@
 #include <string_view>
 
 #include "reliqaclassifier/ServerFeatureText.h"
-#include "tools/reliqa/errors.h"
-#include "tools/reliqa/feature_rows.h"
+#include "tools/common/errors.h"
+#include "tools/common/feature_rows.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMapJson.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
 

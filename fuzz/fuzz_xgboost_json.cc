@@ -13,8 +13,8 @@
 #include <string_view>
 #include <vector>
 
-#include "tools/reliqa/errors.h"
-#include "tools/reliqa/xgboost_model.h"
+#include "tools/common/errors.h"
+#include "tools/common/xgboost_model.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 

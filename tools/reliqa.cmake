@@ -1,48 +1,31 @@
 # The `reliqa` command-line tool (build/bin/reliqa) and its tests.
 #
-# reliqa_tool_readers: JSON readers and I/O (records, server-feature texts and
-#                      the store's JSON encoding, simdjson).
-# reliqa_tool_models:  XGBoost conversion, model inspection, partial dependence
-#                      (needs the engine).
-# reliqa:              the tool (needs the classifier and the store as well).
+# reliqa_tool_models: model inspection, partial dependence and their charts
+#                     (needs the engine).
+# reliqa:             the tool.
 set(_reliqa_dir ${CMAKE_CURRENT_SOURCE_DIR}/reliqa)
 
-add_library(reliqa_tool_readers STATIC
-  ${_reliqa_dir}/chart.cc
-  ${_reliqa_dir}/collection_reader.cc
-  ${_reliqa_dir}/feature_rows.cc
-  ${_reliqa_dir}/io.cc
-  ${_reliqa_dir}/json_doc.cc
-)
-target_include_directories(reliqa_tool_readers PUBLIC ${PROJECT_SOURCE_DIR})
-target_link_libraries(reliqa_tool_readers PUBLIC reliqa_features reliqa_json simdjson::simdjson glog::glog)
-
-reliqa_test(reliqa_tool_readers_test
-  SOURCES ${_reliqa_dir}/collection_reader_test.cc ${_reliqa_dir}/feature_rows_test.cc
-  LIBS reliqa_tool_readers)
-
 add_library(reliqa_tool_models STATIC
+  ${_reliqa_dir}/chart.cc
   ${_reliqa_dir}/inspect.cc
+  ${_reliqa_dir}/io.cc
   ${_reliqa_dir}/pdp.cc
-  ${_reliqa_dir}/xgboost_model.cc
 )
-target_link_libraries(reliqa_tool_models PUBLIC reliqa_tool_readers gbdt reliqa_json)
+target_link_libraries(reliqa_tool_models PUBLIC reliqa_readers gbdt reliqa_json)
 
-reliqa_test(reliqa_tool_models_test
-  SOURCES ${_reliqa_dir}/xgboost_model_test.cc ${_reliqa_dir}/inspect_pdp_test.cc
-  LIBS reliqa_tool_models)
+reliqa_test(reliqa_tool_models_test SOURCES ${_reliqa_dir}/inspect_pdp_test.cc LIBS reliqa_tool_models)
 
 # Features and scores of a few hundred collections, bit for bit as a native
 # build computed them (golden_data.py writes the file): the same on every ABI.
 reliqa_test(reliqa_golden_test
   SOURCES ${_reliqa_dir}/golden_test.cc
-  LIBS reliqa_tool_readers reliqa_features gbdt)
+  LIBS reliqa_readers reliqa_features gbdt)
 target_compile_definitions(reliqa_golden_test PRIVATE
   GOLDEN_COLLECTIONS="${_reliqa_dir}/testdata/golden_collections.jsonl"
   GOLDEN_MODEL="${PROJECT_SOURCE_DIR}/examples/model.txt")
 
 add_executable(reliqa ${_reliqa_dir}/main.cc ${_reliqa_dir}/commands.cc)
-target_link_libraries(reliqa PRIVATE reliqa_tool_models reliqa_classifier keystash CLI11::CLI11)
+target_link_libraries(reliqa PRIVATE reliqa_tool_models reliqa_xgboost reliqa_classifier_store CLI11::CLI11)
 
 # End-to-end tests of the tool as a user runs it: error paths, JSON Lines
 # streaming, the guard that keeps a rejected model out of the store.

@@ -7,73 +7,30 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
 #include <iostream>
 #include <memory>
-#include <system_error>
 
-#include "host/keystash/SqliteKeyValueStore.h"
 #include "reliqaclassifier/FeatureExtraction.h"
-#include "reliqaclassifier/ModelParamsPersistence.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
-#include "tools/reliqa/collection_reader.h"
-#include "tools/reliqa/errors.h"
-#include "tools/reliqa/feature_rows.h"
+#include "tools/common/classifier_store.h"
+#include "tools/common/collection_reader.h"
+#include "tools/common/errors.h"
+#include "tools/common/feature_rows.h"
+#include "tools/common/xgboost_model.h"
 #include "tools/reliqa/inspect.h"
 #include "tools/reliqa/pdp.h"
-#include "tools/reliqa/xgboost_model.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
-#include "xplat/gbdtclassifier/GbdtClassifier/CacheManager.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
 namespace reliqa::tool {
 
 namespace rc = kestrova::reliqaclassifier;
-using kestrova::mobile::xplat::keystash::PersistentKeyValueStore;
 
 namespace {
 
 void warn(const std::string& file, const std::string& what) {
   std::cerr << "reliqa: warning: " << (file.empty() ? "" : file + ": ") << what << std::endl;
-}
-
-// Creates every missing directory above `path`.
-void makeParents(const std::string& path) {
-  const std::filesystem::path parent = std::filesystem::path(path).parent_path();
-  std::error_code error;
-  if (!parent.empty()) std::filesystem::create_directories(parent, error);
-  if (error) throw ToolError(path, 0, "cannot create the directory " + parent.string() + ": " + error.message());
-}
-
-std::shared_ptr<PersistentKeyValueStore> openStore(const std::string& path) {
-  makeParents(path);
-  try {
-    return std::make_shared<kestrova::mobile::xplat::keystash::SqliteKeyValueStore>(path);
-  } catch (const std::exception& e) {
-    throw ToolError(path, 0, std::string("cannot open the store: ") + e.what());
-  }
-}
-
-std::unique_ptr<rc::ReliqasClassifier> openClassifier(const std::string& storePath,
-                                                      std::shared_ptr<PersistentKeyValueStore> store = nullptr) {
-  if (!store) store = openStore(storePath);
-  try {
-    return std::make_unique<rc::ReliqasClassifier>(store);
-  } catch (const std::exception& e) {
-    throw ToolError(storePath, 0,
-                    std::string("the stored model cannot be loaded (") + e.what() +
-                        "); replace it with 'reliqa set-model --model FILE --model-id ID --threshold T'");
-  }
-}
-
-std::unique_ptr<thornvale::BoostingModel> loadModel(const std::string& name, const std::string& text) {
-  try {
-    return std::make_unique<thornvale::BoostingModel>(text);
-  } catch (const std::exception& e) {
-    throw ToolError(name, 0, std::string("the model cannot be loaded: ") + e.what());
-  }
 }
 
 // Calls `onDocument(text, name, firstLine)` for the input: the whole file for
@@ -141,62 +98,16 @@ void setModel(const SetModelOptions& o) {
   rc::ReliqaClassifierModelParams params;
   params.mModelId = o.modelId;
   params.mThreshold = o.threshold;
+  std::string name;
   if (o.model) {
-    std::string name = displayName(*o.model);
+    name = displayName(*o.model);
     params.mSerializedModel = readFile(*o.model);
-    if (!params.mSerializedModel.empty()) {
-      // Load it once here: a model that the classifier cannot load must never
-      // reach the store, where it would stop every later classifier.
-      auto model = loadModel(name, params.mSerializedModel);
-      thornvale::ModelHeader header = readModelHeader(params.mSerializedModel);
-      if (!header.complete || header.magic != thornvale::kModelMagic) {
-        warn(name, "the magic number is " + std::to_string(header.magic) + ", not " +
-                       std::to_string(thornvale::kModelMagic) + "; stored all the same, as the classifier reads it");
-      }
-      if (!thornvale::isReadableVersion(header.version)) {
-        warn(name, "format version " + std::to_string(header.version) +
-                       " is not 2, 3 or 4: the model reads as empty and every score will be 0.5; stored all the same");
-      } else if (model->getForest().trees.empty()) {
-        warn(name, "the model has no trees: every score will be the logistic of its base score; stored all the same");
-      }
-    }
   }
-  auto store = openStore(o.store);
-  std::unique_ptr<rc::ReliqasClassifier> classifier;
-  try {
-    classifier = std::make_unique<rc::ReliqasClassifier>(store);
-  } catch (const std::exception& e) {
-    // The store holds a model that no classifier can load (written by some
-    // other means). A new model, checked above, replaces it; write the
-    // parameters as the classifier would, then make sure a classifier starts.
-    if (params.mSerializedModel.empty()) {
-      throw ToolError(o.store, 0,
-                      std::string("the stored model cannot be loaded (") + e.what() +
-                          "); give a replacement with --model FILE");
-    }
-    warn(o.store, std::string("the stored model cannot be loaded (") + e.what() + "); replacing it");
-    thornvale::CacheManager cache(store, rc::kDefaultKeyPrefix);  // the classifier's own prefix
-    rc::storeModelParams(cache, params);
-    classifier = openClassifier(o.store, store);
-  }
-  try {
-    classifier->setModelParams(params);
-  } catch (const std::exception& e) {
-    throw ToolError(o.store, 0, std::string("storing the model parameters failed: ") + e.what());
-  }
-  if (classifier->currentlyUsedModelId() != o.modelId) {
-    throw ToolError(o.store, 0, "the store did not keep the model parameters (see the messages above)");
-  }
+  tool::setModel(o.store, params, name, "give a replacement with --model FILE", warn);
 }
 
 void setServerFeatures(const std::string& store, const std::string& file) {
-  thornvale::FeatureMap features = parseServerFeatures(readFile(file), displayName(file));
-  auto classifier = openClassifier(store);
-  try {
-    classifier->setServerFeatures(features);
-  } catch (const std::exception& e) {
-    throw ToolError(store, 0, std::string("storing the server features failed: ") + e.what());
-  }
+  tool::setServerFeatures(store, parseServerFeatures(readFile(file), displayName(file)));
 }
 
 void printModelId(const std::string& store, ResultWriter& out) {
@@ -275,29 +186,20 @@ void pdp(const PdpOptions& o, ResultWriter& out) {
 }
 
 void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
-  std::string name = displayName(o.input);
-  std::vector<int64_t> given = parseIdList(o.featureIds);
+  const std::string name = displayName(o.input);
+  const std::vector<int64_t> given = parseIdList(o.featureIds);
   if (o.input.size() > 4 && o.input.compare(o.input.size() - 4, 4, ".ubj") == 0) {
     throw ToolError(name, 0, "binary (UBJSON) models cannot be read; save the model as JSON: save_model(\"model.json\")");
   }
-  XgbModel xgb = readXgboostModel(readFile(o.input), name);
-  std::vector<int32_t> ids = featureIdsOf(xgb, given, name);
-  std::unique_ptr<thornvale::Forest> forest = toForest(xgb, ids);
-  std::string text;
-  try {
-    text = thornvale::writeModel(*forest, thornvale::kNewestVersion);
-    loadModel(name, text);  // what we write must load
-  } catch (const std::exception& e) {
-    throw ToolError(name, 0, std::string("the converted model is not usable: ") + e.what());
-  }
+  const ConvertedModel converted = convertXgboostJson(readFile(o.input), name, given);
   if (o.output == "-") {
-    out.write(text);
+    out.write(converted.text);
   } else {
-    writeFileAtomically(o.output, text);
+    writeFileAtomically(o.output, converted.text);
   }
   if (verbose) {
-    std::cerr << "reliqa: converted " << xgb.trees.size() << " trees over " << ids.size() << " features into "
-              << o.output << std::endl;
+    std::cerr << "reliqa: converted " << converted.trees << " trees over " << converted.featureIds.size()
+              << " features into " << o.output << std::endl;
   }
 }
 

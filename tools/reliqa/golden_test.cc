@@ -20,7 +20,7 @@
 #include <gtest/gtest.h>
 
 #include "reliqaclassifier/FeatureExtraction.h"
-#include "tools/reliqa/collection_reader.h"
+#include "tools/common/collection_reader.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 
 namespace {

@@ -5,7 +5,7 @@
 #include <sstream>
 #include <vector>
 
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 

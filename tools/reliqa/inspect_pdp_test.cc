@@ -2,7 +2,7 @@
 #include <gtest/gtest.h>
 
 #include "tools/reliqa/chart.h"
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 #include "tools/reliqa/inspect.h"
 #include "tools/reliqa/pdp.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"

@@ -6,7 +6,7 @@
 #include <cerrno>
 #include <cstring>
 
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 
 namespace reliqa::tool {
 

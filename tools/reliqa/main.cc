@@ -18,7 +18,7 @@
 #include <vector>
 
 #include "tools/reliqa/commands.h"
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 #include "tools/reliqa/io.h"
 
 namespace {

@@ -1,7 +1,7 @@
 #include "tools/reliqa/pdp.h"
 
 #include "tools/reliqa/chart.h"
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 

@@ -1,4 +1,4 @@
-#include "tools/reliqa/xgboost_model.h"
+#include "tools/common/xgboost_model.h"
 
 #include <double-conversion/double-conversion.h>
 
@@ -11,8 +11,10 @@
 #include <set>
 #include <system_error>
 
-#include "tools/reliqa/errors.h"
-#include "tools/reliqa/json_doc.h"
+#include "tools/common/errors.h"
+#include "tools/common/json_doc.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 
 namespace reliqa::tool {
@@ -462,6 +464,22 @@ std::unique_ptr<thornvale::Forest> toForest(const XgbModel& model, const std::ve
     forest->inputKeys.push_back(model.featureNames.empty() ? std::to_string(featureIds[i]) : model.featureNames[i]);
   }
   return forest;
+}
+
+ConvertedModel convertXgboostJson(std::string_view json, const std::string& name,
+                                  const std::vector<int64_t>& featureIds) {
+  const XgbModel xgb = readXgboostModel(json, name);
+  ConvertedModel out;
+  out.featureIds = featureIdsOf(xgb, featureIds, name);
+  out.trees = xgb.trees.size();
+  const std::unique_ptr<thornvale::Forest> forest = toForest(xgb, out.featureIds);
+  try {
+    out.text = thornvale::writeModel(*forest, thornvale::kNewestVersion);
+    thornvale::BoostingModel check(out.text);  // what we write must load
+  } catch (const std::exception& e) {
+    throw ToolError(name, 0, std::string("the converted model is not usable: ") + e.what());
+  }
+  return out;
 }
 
 }  // namespace reliqa::tool

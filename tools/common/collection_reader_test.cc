@@ -1,10 +1,10 @@
-#include "tools/reliqa/collection_reader.h"
+#include "tools/common/collection_reader.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "tools/reliqa/errors.h"
-#include "tools/reliqa/testing/record_difference.h"
+#include "tools/common/errors.h"
+#include "tools/common/testing/record_difference.h"
 
 namespace reliqa::tool {
 namespace {

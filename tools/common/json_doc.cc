@@ -1,11 +1,11 @@
-#include "tools/reliqa/json_doc.h"
+#include "tools/common/json_doc.h"
 
 #include <algorithm>
 #include <cmath>
 #include <vector>
 
 #include "reliqaclassifier/ServerFeatureText.h"
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 
 namespace reliqa::tool {
 

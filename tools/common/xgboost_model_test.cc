@@ -1,4 +1,4 @@
-#include "tools/reliqa/xgboost_model.h"
+#include "tools/common/xgboost_model.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -6,7 +6,7 @@
 #include <cmath>
 #include <limits>
 
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 

@@ -1,4 +1,4 @@
-#include "tools/reliqa/feature_rows.h"
+#include "tools/common/feature_rows.h"
 
 #include <glog/logging.h>
 
@@ -8,7 +8,7 @@
 #include <system_error>
 
 #include "reliqaclassifier/ServerFeatureText.h"
-#include "tools/reliqa/json_doc.h"
+#include "tools/common/json_doc.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMapJson.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"

@@ -1,9 +1,9 @@
-#include "tools/reliqa/feature_rows.h"
+#include "tools/common/feature_rows.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "tools/reliqa/errors.h"
+#include "tools/common/errors.h"
 
 namespace reliqa::tool {
 namespace {

@@ -7,13 +7,13 @@
 //    which places every problem at its line and names it.
 // The quick one must never accept a text that the careful one refuses, nor
 // read a different value; fuzz_collection_json holds it to that.
-#include "tools/reliqa/collection_reader.h"
+#include "tools/common/collection_reader.h"
 
 #include <cstring>
 #include <vector>
 
-#include "tools/reliqa/collection_schema.h"
-#include "tools/reliqa/json_doc.h"
+#include "tools/common/collection_schema.h"
+#include "tools/common/json_doc.h"
 
 namespace reliqa::tool {
 

@@ -60,6 +60,19 @@ std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64
 
 std::unique_ptr<thornvale::Forest> toForest(const XgbModel& model, const std::vector<int32_t>& featureIds);
 
+// A model text converted from an XGBoost JSON model, and what it holds.
+struct ConvertedModel {
+  std::string text;                 // our model text, newest format version
+  size_t trees = 0;                 // XGBoost trees converted
+  std::vector<int32_t> featureIds;  // the model's featureMapping
+};
+
+// The whole conversion: reads and checks `json`, maps its features to
+// `featureIds` (see featureIdsOf), converts, writes the newest format and
+// makes sure that the text loads. Throws ToolError naming `name`.
+ConvertedModel convertXgboostJson(std::string_view json, const std::string& name,
+                                  const std::vector<int64_t>& featureIds);
+
 // The ids of --feature-ids, one item each as the option splits its text at
 // commas: an optional sign and at most 18 decimal digits, with spaces around;
 // empty items are skipped. Throws UsageError naming the item.
