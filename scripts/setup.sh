@@ -11,6 +11,7 @@ PACKAGES=(
   libgtest-dev libgmock-dev libbenchmark-dev libcli11-dev
   openjdk-17-jdk-headless junit5
   python3 python3-numpy python3-xgboost libxgboost-dev
+  python3-dev pybind11-dev python3-pandas python3-pytest python3-venv python3-pip python3-wheel
 )
 
 missing=()

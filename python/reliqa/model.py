@@ -1,0 +1,222 @@
+"""reliqa.Model: a model text, scored exactly as the phone scores it."""
+
+from __future__ import annotations
+
+import json
+import math
+import os
+from typing import Any, Iterable, Mapping, Optional, Sequence, Union
+
+import numpy as np
+
+from . import _native
+from ._ids import feature_ids as _feature_ids
+
+PathLike = Union[str, "os.PathLike[str]"]
+_Missing = Optional[float]
+
+
+class Model:
+    """A boosted-tree model in reliqa's model text format.
+
+    Scores are bit-identical to the phone's ``BoostingModel::predict`` on a
+    feature map holding each row's present cells: the same float conversion,
+    the same trees (and, with a model selector, the same sub-model) and the
+    same logistic.
+
+    Parameters
+    ----------
+    text:
+        The model text (the base64 lines that ``reliqa set-model`` stores), as
+        ``str`` or ``bytes``.
+
+    Raises
+    ------
+    ValueError
+        When the text is not a model the library can load.
+    """
+
+    def __init__(self, text: Union[str, bytes], *, _name: str = "the model text") -> None:
+        if isinstance(text, str):
+            text = text.encode("utf-8")
+        if not isinstance(text, (bytes, bytearray, memoryview)):
+            raise TypeError(f"a model text is str or bytes, not {type(text).__name__}")
+        self._native = _native.Model(bytes(text), _name)
+
+    @classmethod
+    def load(cls, path: PathLike) -> "Model":
+        """Reads a model text from a file."""
+        with open(path, "rb") as f:
+            return cls(f.read(), _name=os.fspath(path))
+
+    @classmethod
+    def from_xgboost(cls, model: Any, *, feature_ids: Optional[Sequence[int]] = None) -> "Model":
+        """Converts an XGBoost model, as ``reliqa convert xgboost`` does.
+
+        Parameters
+        ----------
+        model:
+            An ``xgboost.Booster`` (or an ``XGBClassifier``/``XGBRegressor``),
+            a path to a model saved as JSON, or the JSON itself as bytes.
+        feature_ids:
+            The feature id of each XGBoost feature, in order. Without it the
+            feature names must be the ids ("1", "2", ...).
+
+        Raises
+        ------
+        ValueError
+            For a model that cannot be represented (not ``gbtree`` with a
+            logistic objective, categorical splits, ...), with the reason.
+        """
+        name = "the XGBoost model"
+        if hasattr(model, "get_booster"):
+            model = model.get_booster()
+        if hasattr(model, "save_raw"):
+            data = bytes(model.save_raw(raw_format="json"))
+        elif isinstance(model, (bytes, bytearray, memoryview)):
+            data = bytes(model)
+        elif isinstance(model, (str, os.PathLike)):
+            name = os.fspath(model)
+            if name.endswith(".ubj"):
+                raise ValueError(f"{name}: binary (UBJSON) models cannot be read; save the model as JSON")
+            with open(model, "rb") as f:
+                data = f.read()
+        else:
+            raise TypeError(f"from_xgboost() takes a Booster, a path or JSON bytes, not {type(model).__name__}")
+        ids = [] if feature_ids is None else _feature_ids(feature_ids, what="feature_ids item")
+        converted = cls.__new__(cls)
+        converted._native = _native.Model.from_xgboost(data, name, ids)
+        return converted
+
+    def save(self, path: PathLike) -> None:
+        """Writes the model text to `path` (through a temporary file, so that a
+        failure leaves no partial file)."""
+        path = os.fspath(path)
+        tmp = f"{path}.tmp-{os.getpid()}"
+        try:
+            with open(tmp, "wb") as f:
+                f.write(self._native.text)
+                f.flush()
+                os.fsync(f.fileno())
+            os.replace(tmp, path)
+        except BaseException:
+            if os.path.exists(tmp):
+                os.unlink(tmp)
+            raise
+
+    @property
+    def text(self) -> bytes:
+        """The model text."""
+        return self._native.text
+
+    @property
+    def feature_ids(self) -> np.ndarray:
+        """The model's feature ids (its featureMapping), int32, in the order of
+        the feature vector: the default column order of :meth:`predict`."""
+        return self._native.feature_ids
+
+    @property
+    def num_trees(self) -> int:
+        """Trees in the model text (trees of weight 0 included)."""
+        return self._native.num_trees
+
+    @property
+    def base_score(self) -> float:
+        """The raw score that the trees' leaves are added to (a margin, not a
+        probability)."""
+        return self._native.base_score
+
+    def predict(
+        self,
+        X: Any,
+        *,
+        feature_ids: Optional[Sequence[Union[int, str]]] = None,
+        missing: _Missing = math.nan,
+        output_margin: bool = False,
+        nthread: int = 0,
+    ) -> np.ndarray:
+        """Scores the rows of `X`.
+
+        Parameters
+        ----------
+        X:
+            A 2-D float32 or float64 numpy array (C or Fortran order; it is
+            not copied), or a pandas DataFrame whose column names are feature
+            ids (ints or decimal strings), in any order.
+        feature_ids:
+            The feature id of each column of an array. Default: the model's
+            :attr:`feature_ids`. Columns the model does not use are ignored;
+            features the model uses that no column gives read 0.0.
+        missing:
+            A cell equal to this value is an absent feature and reads 0.0, as
+            an id absent from the phone's map does (NaN matches NaN). With
+            ``None`` every cell is a value, and NaN takes the trees' NaN
+            branches. (The phone classifies no collection whose features hold
+            NaN or an infinity.)
+        output_margin:
+            Return raw scores instead of probabilities.
+        nthread:
+            Threads to score with; 0 means one per core. Every count gives the
+            same bits.
+
+        Returns
+        -------
+        numpy.ndarray
+            float64, one score per row.
+        """
+        if missing is not None:
+            missing = float(missing)
+        nthread = int(nthread)
+        if nthread < 0:
+            raise ValueError(f"nthread must be 0 (every core) or more, got {nthread}")
+        column_ids = None
+        if _is_dataframe(X):
+            column_ids = _feature_ids(X.columns, what="column")
+            if feature_ids is not None:
+                raise ValueError("feature_ids is for arrays; a DataFrame names its columns itself")
+            X = _frame_values(X)
+        elif feature_ids is not None:
+            column_ids = _feature_ids(feature_ids, what="feature_ids item")
+        if not isinstance(X, np.ndarray):
+            raise TypeError(f"X must be a numpy array or a pandas DataFrame, not {type(X).__name__}")
+        return self._native.predict(X, column_ids, missing, bool(output_margin), nthread)
+
+    def predict_rows(
+        self,
+        rows: Iterable[Union[Mapping[Union[int, str], float], str, bytes]],
+        *,
+        missing: _Missing = math.nan,
+        output_margin: bool = False,
+    ) -> np.ndarray:
+        """Scores sparse rows.
+
+        Parameters
+        ----------
+        rows:
+            Dicts from feature id (int or decimal string) to value, or JSON
+            texts of that shape, such as the "feature_vector" that phones log.
+        missing, output_margin:
+            As for :meth:`predict`.
+        """
+        if missing is not None:
+            missing = float(missing)
+        return self._native.predict_rows(rows, missing, bool(output_margin))
+
+    def __repr__(self) -> str:
+        return f"<reliqa.Model: {self.num_trees} trees over {len(self.feature_ids)} features>"
+
+
+def _is_dataframe(x: Any) -> bool:
+    return type(x).__name__ == "DataFrame" and hasattr(x, "columns") and hasattr(x, "dtypes")
+
+
+def _frame_values(frame: Any) -> np.ndarray:
+    """The cells of a DataFrame as one float array, without a copy where the
+    frame holds one block of float32 or float64."""
+    dtypes = set(frame.dtypes)
+    if len(dtypes) == 1 and next(iter(dtypes)) in (np.dtype(np.float32), np.dtype(np.float64)):
+        return frame.to_numpy(copy=False)
+    for name, dtype in frame.dtypes.items():
+        if not (np.issubdtype(dtype, np.number) or np.issubdtype(dtype, np.bool_)):
+            raise ValueError(f"column {name!r} holds {dtype}, not numbers")
+    return frame.to_numpy(dtype=np.float64)

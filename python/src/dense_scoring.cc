@@ -1,0 +1,133 @@
+#include "python/src/dense_scoring.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstring>
+#include <exception>
+#include <stdexcept>
+#include <string>
+#include <thread>
+#include <unordered_map>
+
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
+
+namespace reliqa::python {
+
+namespace {
+
+// Rows scored together: the block of float vectors stays in the first cache
+// levels while the trees walk it.
+constexpr size_t kBlockRows = 64;
+
+template <typename Cell>
+Cell cellAt(const Matrix& x, size_t r, size_t c) {
+  Cell v;
+  std::memcpy(&v, x.data + static_cast<ptrdiff_t>(r) * x.rowStride + static_cast<ptrdiff_t>(c) * x.colStride,
+              sizeof v);
+  return v;
+}
+
+// Writes rows [first, first + n) as feature vectors of `length` floats.
+template <typename Cell>
+void fillBlock(const Matrix& x, const std::vector<int64_t>& columns, std::optional<double> missing, size_t first,
+               size_t n, float* block) {
+  const size_t length = columns.size();
+  const bool missingIsNaN = missing && std::isnan(*missing);
+  for (size_t r = 0; r < n; ++r) {
+    float* vector = block + r * length;
+    for (size_t p = 0; p < length; ++p) {
+      const int64_t c = columns[p];
+      if (c < 0) {
+        vector[p] = 0.0f;
+        continue;
+      }
+      const double v = static_cast<double>(cellAt<Cell>(x, first + r, static_cast<size_t>(c)));
+      const bool absent = missing && (missingIsNaN ? std::isnan(v) : v == *missing);
+      vector[p] = absent ? 0.0f : static_cast<float>(v);
+    }
+  }
+}
+
+void rawScores(const thornvale::BoostingModel& model, const float* block, size_t n, size_t length, double* out) {
+  std::vector<float> vector(length);
+  for (size_t r = 0; r < n; ++r) {
+    std::copy(block + r * length, block + (r + 1) * length, vector.begin());
+    out[r] = model.getEnsemble().unnormalizedScore(vector);
+  }
+}
+
+void scoreRange(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
+                std::optional<double> missing, bool probability, size_t first, size_t end, double* out) {
+  if (model.hasConstantScore()) {
+    std::fill(out + first, out + end, model.rawScore(thornvale::FeatureMap{}));
+  } else {
+    const size_t length = columns.size();
+    std::vector<float> block(kBlockRows * length);
+    for (size_t at = first; at < end; at += kBlockRows) {
+      const size_t n = std::min(kBlockRows, end - at);
+      if (x.isDouble) {
+        fillBlock<double>(x, columns, missing, at, n, block.data());
+      } else {
+        fillBlock<float>(x, columns, missing, at, n, block.data());
+      }
+      rawScores(model, block.data(), n, length, out + at);
+    }
+  }
+  if (probability) {
+    for (size_t r = first; r < end; ++r) out[r] = thornvale::logistic(out[r]);
+  }
+}
+
+}  // namespace
+
+std::vector<int64_t> columnsForModel(const thornvale::BoostingModel& model, const std::vector<int32_t>& columnIds) {
+  std::unordered_map<int32_t, int64_t> columnOf;
+  for (size_t c = 0; c < columnIds.size(); ++c) {
+    const auto [at, inserted] = columnOf.emplace(columnIds[c], static_cast<int64_t>(c));
+    if (!inserted) {
+      throw std::invalid_argument("feature id " + std::to_string(columnIds[c]) + " names two columns (" +
+                                  std::to_string(at->second) + " and " + std::to_string(c) + ")");
+    }
+  }
+  const std::vector<uint32_t>& mapping = model.getForest().featureMapping;
+  const auto& lastPosition = model.getFeatureIndex();
+  std::vector<int64_t> columns(mapping.size(), -1);
+  for (size_t p = 0; p < mapping.size(); ++p) {
+    if (lastPosition.at(mapping[p]) != p) continue;
+    const auto found = columnOf.find(static_cast<int32_t>(mapping[p]));
+    if (found != columnOf.end()) columns[p] = found->second;
+  }
+  return columns;
+}
+
+void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
+                std::optional<double> missing, bool probability, unsigned threads, double* out) {
+  if (threads == 0) threads = std::max(1u, std::thread::hardware_concurrency());
+  // At least a few blocks per thread, or threads cost more than they give.
+  const size_t useful = std::max<size_t>(1, x.rows / (4 * kBlockRows));
+  const size_t count = std::min<size_t>(threads, useful);
+  if (count <= 1) {
+    scoreRange(model, x, columns, missing, probability, 0, x.rows, out);
+    return;
+  }
+  std::vector<std::exception_ptr> failures(count);
+  std::vector<std::thread> workers;
+  workers.reserve(count);
+  for (size_t t = 0; t < count; ++t) {
+    const size_t first = x.rows * t / count;
+    const size_t end = x.rows * (t + 1) / count;
+    workers.emplace_back([&, t, first, end] {
+      try {
+        scoreRange(model, x, columns, missing, probability, first, end, out);
+      } catch (...) {
+        failures[t] = std::current_exception();
+      }
+    });
+  }
+  for (auto& w : workers) w.join();
+  for (const auto& f : failures) {
+    if (f) std::rethrow_exception(f);
+  }
+}
+
+}  // namespace reliqa::python

@@ -1,0 +1,365 @@
+// reliqa._native: the library's model, features and classifier for the
+// Python package (python/reliqa/), which gives them their public API.
+//
+// Every refused input raises ValueError with a message that names what and
+// where; nothing here may crash the interpreter. Native work (scoring many
+// rows, classifying) runs without the interpreter's lock.
+#include <glog/logging.h>
+#include <pybind11/numpy.h>
+#include <pybind11/pybind11.h>
+#include <pybind11/stl.h>
+
+#include <charconv>
+#include <cmath>
+#include <cstdlib>
+#include <iostream>
+#include <memory>
+#include <optional>
+#include <sstream>
+#include <stdexcept>
+#include <string>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "python/src/dense_scoring.h"
+#include "reliqaclassifier/FeatureExtraction.h"
+#include "reliqaclassifier/ReliqasClassifier.h"
+#include "tools/common/classifier_store.h"
+#include "tools/common/collection_reader.h"
+#include "tools/common/errors.h"
+#include "tools/common/feature_rows.h"
+#include "tools/common/xgboost_model.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
+
+namespace py = pybind11;
+
+namespace reliqa::python {
+namespace {
+
+namespace rc = kestrova::reliqaclassifier;
+using thornvale::FeatureMap;
+
+// Number of computed features: ids 1 to kFeatureCount.
+constexpr int32_t kFeatureCount = 74;
+
+// Sends what the model reader prints on standard output ("Deseralization
+// version: ...") nowhere while a model is read; the interpreter's lock keeps
+// other Python threads out meanwhile.
+class QuietStdout {
+ public:
+  QuietStdout() : saved_(std::cout.rdbuf(sink_.rdbuf())) {}
+  ~QuietStdout() { std::cout.rdbuf(saved_); }
+
+ private:
+  std::ostringstream sink_;
+  std::streambuf* saved_;
+};
+
+std::unique_ptr<thornvale::BoostingModel> readModel(const std::string& text, const std::string& name) {
+  QuietStdout quiet;
+  return tool::loadModel(name, text);
+}
+
+// A Python int or decimal string as a signed 32-bit feature id.
+int32_t featureId(const py::handle& key, const std::string& where) {
+  if (py::isinstance<py::str>(key)) {
+    const std::string s = key.cast<std::string>();
+    int32_t id = 0;
+    const auto [end, error] = std::from_chars(s.data(), s.data() + s.size(), id);
+    if (error == std::errc() && end == s.data() + s.size() && !s.empty()) return id;
+    throw std::invalid_argument(where + ": feature id '" + s + "' is not a decimal signed 32-bit integer");
+  }
+  if (!py::isinstance<py::bool_>(key) && PyIndex_Check(key.ptr())) {
+    const auto big = py::int_(py::reinterpret_borrow<py::object>(key));
+    const long long v = PyLong_AsLongLong(big.ptr());
+    if (v == -1 && PyErr_Occurred()) PyErr_Clear();
+    else if (v >= INT32_MIN && v <= INT32_MAX) return static_cast<int32_t>(v);
+    throw std::invalid_argument(where + ": feature id " + py::str(key).cast<std::string>() +
+                                " is outside the signed 32-bit range");
+  }
+  throw std::invalid_argument(where + ": a feature id is an int or a decimal string, not " +
+                              py::str(key.get_type().attr("__name__")).cast<std::string>());
+}
+
+double featureValue(const py::handle& value, const std::string& where) {
+  if (py::isinstance<py::str>(value) || py::isinstance<py::bytes>(value) || value.is_none()) {
+    throw std::invalid_argument(where + ": a feature value is a number, not " +
+                                py::str(value.get_type().attr("__name__")).cast<std::string>());
+  }
+  const double v = PyFloat_AsDouble(value.ptr());
+  if (v == -1.0 && PyErr_Occurred()) {
+    PyErr_Clear();
+    throw std::invalid_argument(where + ": a feature value is a number, not " +
+                                py::str(value.get_type().attr("__name__")).cast<std::string>());
+  }
+  return v;
+}
+
+bool isAbsent(double v, std::optional<double> missing) {
+  return missing && (std::isnan(*missing) ? std::isnan(v) : v == *missing);
+}
+
+class Model {
+ public:
+  Model(std::string text, std::string name) : text_(std::move(text)), model_(readModel(text_, name)) {}
+
+  static Model fromXgboost(const std::string& json, const std::string& name, const std::vector<int64_t>& ids) {
+    return Model(tool::convertXgboostJson(json, name, ids).text, name);
+  }
+
+  py::bytes text() const { return py::bytes(text_); }
+
+  py::array_t<int32_t> featureIds() const {
+    const auto& mapping = model_->getForest().featureMapping;
+    py::array_t<int32_t> out(static_cast<py::ssize_t>(mapping.size()));
+    auto w = out.mutable_unchecked<1>();
+    for (size_t i = 0; i < mapping.size(); ++i) w(static_cast<py::ssize_t>(i)) = static_cast<int32_t>(mapping[i]);
+    return out;
+  }
+  size_t numTrees() const { return model_->getForest().trees.size(); }
+  double baseScore() const { return model_->getForest().baseScore; }
+
+  py::array_t<double> predict(const py::array& x, std::optional<std::vector<int32_t>> columnIds,
+                              std::optional<double> missing, bool outputMargin, unsigned nthread) const {
+    if (x.ndim() != 2) {
+      throw std::invalid_argument("X must be a 2-D array, got " + std::to_string(x.ndim()) + " dimensions");
+    }
+    Matrix m;
+    if (x.dtype().is(py::dtype::of<double>())) {
+      m.isDouble = true;
+    } else if (!x.dtype().is(py::dtype::of<float>())) {
+      throw std::invalid_argument("X must hold float32 or float64 values, got " +
+                                  py::str(x.dtype()).cast<std::string>());
+    }
+    m.data = static_cast<const char*>(x.data());
+    m.rows = static_cast<size_t>(x.shape(0));
+    m.cols = static_cast<size_t>(x.shape(1));
+    m.rowStride = x.strides(0);
+    m.colStride = x.strides(1);
+    std::vector<int64_t> columns;
+    if (columnIds) {
+      if (columnIds->size() != m.cols) {
+        throw std::invalid_argument("X has " + std::to_string(m.cols) + " columns but feature_ids names " +
+                                    std::to_string(columnIds->size()));
+      }
+      columns = columnsForModel(*model_, *columnIds);
+    } else {
+      const auto& mapping = model_->getForest().featureMapping;
+      if (mapping.size() != m.cols) {
+        throw std::invalid_argument("X has " + std::to_string(m.cols) + " columns but the model reads " +
+                                    std::to_string(mapping.size()) +
+                                    " features; give feature_ids to name the columns");
+      }
+      columns.assign(mapping.size(), -1);
+      for (size_t p = 0; p < mapping.size(); ++p) {
+        if (model_->getFeatureIndex().at(mapping[p]) == p) columns[p] = static_cast<int64_t>(p);
+      }
+    }
+    py::array_t<double> out(static_cast<py::ssize_t>(m.rows));
+    double* o = out.mutable_data();
+    {
+      py::gil_scoped_release release;
+      scoreDense(*model_, m, columns, missing, !outputMargin, nthread, o);
+    }
+    return out;
+  }
+
+  py::array_t<double> predictRows(const py::iterable& rows, std::optional<double> missing, bool outputMargin) const {
+    std::vector<double> scores;
+    size_t index = 0;
+    for (const py::handle row : rows) {
+      const std::string where = "row " + std::to_string(index);
+      FeatureMap map;
+      if (py::isinstance<py::str>(row) || py::isinstance<py::bytes>(row)) {
+        for (const auto& [id, value] : tool::parseFeatureRow(row.cast<std::string>(), where)) {
+          if (!isAbsent(value, missing)) map.emplace(id, value);
+        }
+      } else if (py::isinstance<py::dict>(row)) {
+        for (const auto& [key, value] : row.cast<py::dict>()) {
+          const int32_t id = featureId(key, where);
+          const double v = featureValue(value, where + ", feature " + std::to_string(id));
+          if (isAbsent(v, missing)) continue;
+          if (!map.emplace(id, v).second) {
+            throw std::invalid_argument(where + ": feature id " + std::to_string(id) + " is given twice");
+          }
+        }
+      } else {
+        throw std::invalid_argument(where + ": a row is a dict or a JSON text, not " +
+                                    py::str(row.get_type().attr("__name__")).cast<std::string>());
+      }
+      const double raw = model_->rawScore(map);
+      scores.push_back(outputMargin ? raw : thornvale::logistic(raw));
+      ++index;
+    }
+    return py::array_t<double>(static_cast<py::ssize_t>(scores.size()), scores.data());
+  }
+
+ private:
+  std::string text_;
+  std::unique_ptr<thornvale::BoostingModel> model_;
+};
+
+// The computed features of collection texts, as rows of 74 columns (ids 1 to
+// 74); a feature that a collection does not have is NaN. `firstLines` gives
+// each text's line in the file `name`; when it is empty, messages name a
+// text "<name> <index>".
+py::array_t<double> extractFeatures(const std::vector<std::string>& texts, const std::string& name,
+                                    const std::vector<int64_t>& firstLines) {
+  py::array_t<double> out({static_cast<py::ssize_t>(texts.size()), static_cast<py::ssize_t>(kFeatureCount)});
+  double* o = out.mutable_data();
+  {
+    py::gil_scoped_release release;
+    tool::CollectionReader reader;
+    rc::ReliqaClassifierInput collection;
+    for (size_t i = 0; i < texts.size(); ++i) {
+      // A file's texts are named by their lines, others by their index.
+      const int64_t line = i < firstLines.size() ? firstLines[i] : 0;
+      const std::string where = firstLines.empty() ? name + " " + std::to_string(i) : name;
+      reader.read(texts[i], where, line, collection);
+      FeatureMap features;
+      try {
+        features = rc::extractFeatures(collection);
+      } catch (const std::exception& e) {
+        throw tool::ToolError(where, line, std::string("feature extraction failed: ") + e.what());
+      }
+      double* row = o + i * kFeatureCount;
+      std::fill(row, row + kFeatureCount, std::nan(""));
+      for (const auto& [id, value] : features) {
+        if (id >= 1 && id <= kFeatureCount) row[id - 1] = value;
+      }
+    }
+  }
+  return out;
+}
+
+class Classifier {
+ public:
+  explicit Classifier(std::string store) : store_(std::move(store)) { open(); }
+
+  // Returns the warnings to raise in Python.
+  std::vector<std::string> setModel(const std::string& text, const std::string& modelId, double threshold) {
+    rc::ReliqaClassifierModelParams params;
+    params.mSerializedModel = text;
+    params.mModelId = modelId;
+    params.mThreshold = threshold;
+    std::vector<std::string> warnings;
+    {
+      QuietStdout quiet;
+      classifier_.reset();  // one writer of the store at a time
+      try {
+        tool::setModel(store_, params, "the model text", "give a replacement model text to set_model()",
+                       [&](const std::string& file, const std::string& what) {
+                         warnings.push_back(file.empty() ? what : file + ": " + what);
+                       });
+      } catch (...) {
+        reopenQuietly();
+        throw;
+      }
+      open();
+    }
+    return warnings;
+  }
+
+  void setServerFeatures(const std::string& json) {
+    const FeatureMap features = tool::parseServerFeatures(json, "server features");
+    ensureOpen();
+    try {
+      classifier_->setServerFeatures(features);
+    } catch (const std::exception& e) {
+      throw tool::ToolError(store_, 0, std::string("storing the server features failed: ") + e.what());
+    }
+  }
+
+  py::dict classify(const std::string& json) {
+    ensureOpen();
+    const rc::ReliqaClassifierInput collection = tool::parseCollection(json, "the collection");
+    rc::ReliqaClassifierResult r;
+    {
+      py::gil_scoped_release release;
+      try {
+        r = classifier_->classify(collection);
+      } catch (const std::exception& e) {
+        throw tool::ToolError("the collection", 0, std::string("classification failed: ") + e.what());
+      }
+    }
+    py::dict logging;
+    for (const auto& [key, value] : r.loggingData) logging[py::str(key)] = py::str(value);
+    py::dict out;
+    out["score"] = r.score;
+    out["isOverThreshold"] = r.isOverThreshold;
+    out["loggingData"] = logging;
+    return out;
+  }
+
+  std::string modelId() {
+    ensureOpen();
+    return classifier_->currentlyUsedModelId();
+  }
+
+ private:
+  void open() {
+    QuietStdout quiet;
+    classifier_ = tool::openClassifier(store_);
+  }
+  void ensureOpen() {
+    if (!classifier_) open();
+  }
+  void reopenQuietly() {
+    try {
+      open();
+    } catch (const std::exception&) {
+      classifier_.reset();  // opened again, with its message, on next use
+    }
+  }
+
+  std::string store_;
+  std::unique_ptr<rc::ReliqasClassifier> classifier_;
+};
+
+void quietLogging() {
+  if (!google::IsGoogleLoggingInitialized()) google::InitGoogleLogging("reliqa");
+  // INFO (every model load, every score) is off unless asked for.
+  if (std::getenv("GLOG_minloglevel") == nullptr) FLAGS_minloglevel = google::GLOG_WARNING;
+  FLAGS_logtostderr = true;
+}
+
+}  // namespace
+}  // namespace reliqa::python
+
+PYBIND11_MODULE(_native, m) {
+  using namespace reliqa::python;
+  m.doc() = "Native part of the reliqa package; use the reliqa module instead.";
+  quietLogging();
+  py::register_exception_translator([](std::exception_ptr p) {
+    try {
+      if (p) std::rethrow_exception(p);
+    } catch (const reliqa::tool::ToolError& e) {
+      PyErr_SetString(PyExc_ValueError, e.describe().c_str());
+    } catch (const std::invalid_argument& e) {
+      PyErr_SetString(PyExc_ValueError, e.what());
+    }
+  });
+
+  py::class_<Model>(m, "Model")
+      .def(py::init<std::string, std::string>(), py::arg("text"), py::arg("name"))
+      .def_static("from_xgboost", &Model::fromXgboost, py::arg("json"), py::arg("name"), py::arg("feature_ids"))
+      .def_property_readonly("text", &Model::text)
+      .def_property_readonly("feature_ids", &Model::featureIds)
+      .def_property_readonly("num_trees", &Model::numTrees)
+      .def_property_readonly("base_score", &Model::baseScore)
+      .def("predict", &Model::predict, py::arg("x"), py::arg("column_ids"), py::arg("missing"),
+           py::arg("output_margin"), py::arg("nthread"))
+      .def("predict_rows", &Model::predictRows, py::arg("rows"), py::arg("missing"), py::arg("output_margin"));
+
+  m.def("extract_features", &extractFeatures, py::arg("texts"), py::arg("name"), py::arg("first_lines"));
+  m.attr("FEATURE_COUNT") = kFeatureCount;
+
+  py::class_<Classifier>(m, "Classifier")
+      .def(py::init<std::string>(), py::arg("store"))
+      .def("set_model", &Classifier::setModel, py::arg("text"), py::arg("model_id"), py::arg("threshold"))
+      .def("set_server_features", &Classifier::setServerFeatures, py::arg("json"))
+      .def("classify", &Classifier::classify, py::arg("json"))
+      .def_property_readonly("model_id", &Classifier::modelId);
+}
