@@ -9,6 +9,8 @@
 #   dist/reliqa.aar       the Android library: AndroidManifest.xml,
 #                         classes.jar and jni/<Android ABI>/ with the stripped
 #                         libraries of x86_64, arm64-v8a and armeabi-v7a
+#   dist/reliqa-*.whl     the Python package of the plain build (build/python/),
+#                         when that build has made it
 # Usage: scripts/package.sh
 # It packages the shipped builds of scripts/build-abi.sh: build-x86_64/,
 # build-arm64/ and build-armhf/, all three (the archive holds every ABI); each
@@ -45,4 +47,7 @@ for abi in "${ABIS[@]}"; do
 done
 /usr/bin/python3 scripts/aar.py write dist/reliqa.aar --classes dist/reliqa.jar \
   --jni x86_64=dist/x86_64 --jni arm64-v8a=dist/arm64 --jni armeabi-v7a=dist/armhf
+if [ -d build/python/reliqa ]; then
+  /usr/bin/python3 scripts/wheel.py build/python dist >/dev/null
+fi
 echo "package: wrote dist/ (check it with scripts/check-libs.sh)" >&2

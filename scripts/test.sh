@@ -12,7 +12,9 @@
 #      emulator, the JVM suite in that ABI's Java runtime), the checks of the
 #      libraries that ship, and the example classified with the same output
 #      bytes as by the plain build;
-#   6. dist/ and the Android archive, packaged from those builds and checked.
+#   6. dist/ and the Android archive, packaged from those builds and checked,
+#      and the Python wheel installed into a fresh virtual environment, where
+#      the README's example runs.
 # Any failure or sanitizer report makes it exit non-zero.
 set -euo pipefail
 cd "$(dirname "$0")/.."
@@ -79,5 +81,8 @@ bash scripts/check-libs.sh build-x86_64="$aar/jni/x86_64" build-arm64="$aar/jni/
   build-armhf="$aar/jni/armeabi-v7a" >/dev/null
 rm -rf "$aar"
 echo "dist/reliqa.aar: the layout is right and every library in it passes check-libs"
+
+step "the Python wheel in a fresh virtual environment"
+bash scripts/test-wheel.sh dist/reliqa-*.whl
 
 step "all tests passed"
