@@ -409,7 +409,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
         }
         size_t j = i + 1;
         while (j < end && takenByLayout(j)) ++j;
-        sumCompleteRows(complete_, i, j, keys, lanes);
+        sumCompleteRows(complete_, i, j, slots, keys, lanes);
         i = j;
       }
       std::copy(lanes, lanes + n, sums);
@@ -582,7 +582,7 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::unnormalizedScores(const float
                                 std::to_string(requiredFeatures_ - 1));
   }
   const size_t slots = requiredFeatures_ + 1;
-  std::vector<uint32_t> keys(2 * slots * kBlockRows);
+  std::vector<uint32_t> keys(std::max(completeBlockKeyWords(slots), 2 * slots * kBlockRows));
   // Rows of a window, sorted by the range of trees they select, go to the
   // walks in blocks of one range each.
   const float* row[kWindow];
