@@ -94,6 +94,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   // The gather kernels read a copy of the features on the stack.
   static constexpr size_t kMaxGatherFeatures = 1023;
   static_assert(kMaxGatherFeatures <= kWalkMaxFeature, "the NaN slot must fit a WalkNode");
+  static_assert(kMaxGatherFeatures < 4096, "vectors that the kernels lay out are copied by blocks");
 
   bool init(const Forest* forest, bool remap) override;
 
@@ -349,42 +350,72 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   static constexpr size_t kRowsInStep = 16;
   // Rows sorted by sub-model at a time.
   static constexpr size_t kWindow = 4 * kBlockRows;
+  // Widest vector whose rows the compiled-tree walk of a block copies out by
+  // feature; wider ones are walked a row at a time.
+  static constexpr size_t kMaxBlockCopy = 4096;
 
-  // Adds the leaf of `tree` to sums[k] for rows[0, n), walking the compiled
-  // nodes with kRowsInStep rows in lock step (rows that reach a leaf early
-  // stay there, as in walkBlock()).
-  void addTreeToRows(const FlatTree& tree, const float* const* rows, size_t n, double* sums) const {
+  // One step of a row in a block copied out by feature: x points at the
+  // row's value of feature 0, and feature f is kBlockRows floats further per
+  // f. The rules are those of step().
+  template <bool kRoot, bool kMasked>
+  static uint32_t stepInBlock(const FlatNode* nodes, uint32_t index, const float* x) {
+    const FlatNode& n = nodes[index];
+    const auto f = static_cast<int32_t>(n.featureId);
+    const uint32_t isSplit = kMasked ? static_cast<uint32_t>(f != kLeaf) : 1u;
+    const size_t at = static_cast<size_t>(static_cast<uint32_t>(kMasked ? f & -static_cast<int32_t>(isSplit) : f));
+    const float v = x[at * kBlockRows];
+    const uint32_t second = kRoot ? static_cast<uint32_t>(!(v <= n.value)) : static_cast<uint32_t>(v > n.value);
+    const uint32_t next = static_cast<uint32_t>(n.child) + second;
+    return kMasked ? index ^ ((index ^ next) & (0u - isSplit)) : next;
+  }
+
+  // Adds the leaf of `tree` to sums[k] for rows[0, n). `byFeature` is the
+  // block copied out by feature (byFeature[f * kBlockRows + k] is feature f
+  // of row k, rows past n repeating row 0, up to the next multiple of
+  // kRowsInStep), or null; with it the compiled nodes are walked by
+  // kRowsInStep rows in lock step (rows that reach a leaf early stay there,
+  // as in walkBlock()).
+  void addTreeToRows(const FlatTree& tree, const float* const* rows, const float* byFeature, size_t n,
+                     double* sums) const {
     const FlatNode* nodes = tree.nodes.data();
-    if (tree.hasEqualityFeature || nodes[0].featureId == kLeaf) {
+    if (byFeature == nullptr || tree.hasEqualityFeature || nodes[0].featureId == kLeaf) {
       for (size_t k = 0; k < n; ++k) sums[k] += static_cast<double>(leafValue(tree, rows[k]));
       return;
     }
     const uint32_t rounds = tree.depth;
     const uint32_t unmasked = std::min(tree.leafDepth, rounds);
     for (size_t r0 = 0; r0 < n; r0 += kRowsInStep) {
-      const size_t m = std::min(kRowsInStep, n - r0);
-      const float* const* x = rows + r0;
+      const float* x = byFeature + r0;
       uint32_t index[kRowsInStep];
-      if (m == kRowsInStep) {
 #pragma GCC unroll 16
-        for (size_t k = 0; k < kRowsInStep; ++k) index[k] = step<true, false>(nodes, 0, x[k]);
-        uint32_t r = 1;
-        for (; r < unmasked; ++r) {
+      for (size_t k = 0; k < kRowsInStep; ++k) index[k] = stepInBlock<true, false>(nodes, 0, x + k);
+      uint32_t r = 1;
+      for (; r < unmasked; ++r) {
 #pragma GCC unroll 16
-          for (size_t k = 0; k < kRowsInStep; ++k) index[k] = step<false, false>(nodes, index[k], x[k]);
-        }
-        for (; r < rounds; ++r) {
-#pragma GCC unroll 16
-          for (size_t k = 0; k < kRowsInStep; ++k) index[k] = step<false, true>(nodes, index[k], x[k]);
-        }
-      } else {
-        for (size_t k = 0; k < m; ++k) index[k] = step<true, false>(nodes, 0, x[k]);
-        for (uint32_t r = 1; r < rounds; ++r) {
-          for (size_t k = 0; k < m; ++k) index[k] = step<false, true>(nodes, index[k], x[k]);
-        }
+        for (size_t k = 0; k < kRowsInStep; ++k) index[k] = stepInBlock<false, false>(nodes, index[k], x + k);
       }
+      for (; r < rounds; ++r) {
+#pragma GCC unroll 16
+        for (size_t k = 0; k < kRowsInStep; ++k) index[k] = stepInBlock<false, true>(nodes, index[k], x + k);
+      }
+      const size_t m = std::min(kRowsInStep, n - r0);
       for (size_t k = 0; k < m; ++k) sums[r0 + k] += static_cast<double>(nodes[index[k]].value);
     }
+  }
+
+  // Copies rows[0, n) out by feature for addTreeToRows(); returns null when
+  // the rows are too wide to copy.
+  const float* copyByFeature(const float* const* rows, size_t n, float* out) const {
+    if (requiredFeatures_ > kMaxBlockCopy) return nullptr;
+    const size_t filled = (n + kRowsInStep - 1) / kRowsInStep * kRowsInStep;
+    for (size_t k = 0; k < filled; ++k) {
+      const float* x = rows[k < n ? k : 0];
+      for (size_t f = 0; f < requiredFeatures_; ++f) out[f * kBlockRows + k] = x[f];
+    }
+    // A forest without splits reads nothing, yet its walk may point at
+    // feature 0.
+    if (requiredFeatures_ == 0) std::fill(out, out + filled, 0.0f);
+    return out;
   }
 
   bool takenByLayout(size_t tree) const {
@@ -392,7 +423,9 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
 
   // Scores rows[0, n) (n <= kBlockRows), all of which select trees
-  // [first, end), into sums[0, n). `keys` has room for the block's keys.
+  // [first, end), into sums[0, n). `keys` has room for the block's keys, or
+  // for its rows copied by feature; it is empty for vectors wider than
+  // kMaxBlockCopy, which no kernel lays out.
   void scoreBlock(const float* const* rows, size_t n, size_t first, size_t end, uint32_t* keys,
                   double* sums) const {
     std::fill(sums, sums + n, baseScore_);
@@ -403,7 +436,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
       completeBlockKeys(rows, n, slots, keys);
       for (size_t i = first; i < end;) {
         if (!takenByLayout(i)) {
-          addTreeToRows(trees_[i], rows, n, lanes);
+          addTreeToRows(trees_[i], rows, nullptr, n, lanes);
           ++i;
           continue;
         }
@@ -438,7 +471,8 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
       }
       return;
     }
-    for (size_t i = first; i < end; ++i) addTreeToRows(trees_[i], rows, n, sums);
+    const float* byFeature = copyByFeature(rows, n, reinterpret_cast<float*>(keys));
+    for (size_t i = first; i < end; ++i) addTreeToRows(trees_[i], rows, byFeature, n, sums);
   }
 
   // The features, the NaN slot at position requiredFeatures_, and NaN up to a
@@ -582,7 +616,9 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::unnormalizedScores(const float
                                 std::to_string(requiredFeatures_ - 1));
   }
   const size_t slots = requiredFeatures_ + 1;
-  std::vector<uint32_t> keys(std::max(completeBlockKeyWords(slots), 2 * slots * kBlockRows));
+  std::vector<uint32_t> keys(
+      requiredFeatures_ <= kMaxBlockCopy ? std::max(completeBlockKeyWords(slots), 2 * slots * kBlockRows) : 0);
+  static_assert(sizeof(float) == sizeof(uint32_t), "the rows copied by feature fit the keys");
   // Rows of a window, sorted by the range of trees they select, go to the
   // walks in blocks of one range each.
   const float* row[kWindow];
