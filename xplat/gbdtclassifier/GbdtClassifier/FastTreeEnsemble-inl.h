@@ -356,17 +356,16 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
 
   // One step of a row in a block copied out by feature: x points at the
   // row's value of feature 0, and feature f is kBlockRows floats further per
-  // f. The rules are those of step().
+  // f; a leaf (feature -1) reads the row before feature 0, which exists, and
+  // keeps its index. The rules are those of step().
   template <bool kRoot, bool kMasked>
   static uint32_t stepInBlock(const FlatNode* nodes, uint32_t index, const float* x) {
     const FlatNode& n = nodes[index];
-    const auto f = static_cast<int32_t>(n.featureId);
-    const uint32_t isSplit = kMasked ? static_cast<uint32_t>(f != kLeaf) : 1u;
-    const size_t at = static_cast<size_t>(static_cast<uint32_t>(kMasked ? f & -static_cast<int32_t>(isSplit) : f));
-    const float v = x[at * kBlockRows];
+    const auto f = static_cast<ptrdiff_t>(n.featureId);
+    const float v = x[f * static_cast<ptrdiff_t>(kBlockRows)];
     const uint32_t second = kRoot ? static_cast<uint32_t>(!(v <= n.value)) : static_cast<uint32_t>(v > n.value);
     const uint32_t next = static_cast<uint32_t>(n.child) + second;
-    return kMasked ? index ^ ((index ^ next) & (0u - isSplit)) : next;
+    return kMasked && f == kLeaf ? index : next;
   }
 
   // Adds the leaf of `tree` to sums[k] for rows[0, n). `byFeature` is the
@@ -403,18 +402,19 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
     }
   }
 
-  // Copies rows[0, n) out by feature for addTreeToRows(); returns null when
-  // the rows are too wide to copy.
-  const float* copyByFeature(const float* const* rows, size_t n, float* out) const {
+  // Copies rows[0, n) out by feature for addTreeToRows() into `buffer`
+  // (kBlockRows * (requiredFeatures_ + 1) floats), after a row of zeros that
+  // leaves read; returns the start of feature 0, or null when the rows are
+  // too wide to copy.
+  const float* copyByFeature(const float* const* rows, size_t n, float* buffer) const {
     if (requiredFeatures_ > kMaxBlockCopy) return nullptr;
+    std::fill(buffer, buffer + kBlockRows, 0.0f);
+    float* out = buffer + kBlockRows;
     const size_t filled = (n + kRowsInStep - 1) / kRowsInStep * kRowsInStep;
     for (size_t k = 0; k < filled; ++k) {
       const float* x = rows[k < n ? k : 0];
       for (size_t f = 0; f < requiredFeatures_; ++f) out[f * kBlockRows + k] = x[f];
     }
-    // A forest without splits reads nothing, yet its walk may point at
-    // feature 0.
-    if (requiredFeatures_ == 0) std::fill(out, out + filled, 0.0f);
     return out;
   }
 
