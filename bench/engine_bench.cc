@@ -9,15 +9,27 @@
 //                                 trees, which CPUs without AVX-512 run
 //   ScorePortable/<model>/<bits>  the same with 8 compiled trees in lock step
 //   OneByOne/<model>/<bits>   the same sum, one tree after another
+//   ScoreBlock/<model>/<bits>         unnormalizedScores over kBlockVectors
+//                                     rows with the CPU's best kernel;
+//                                     row_time is the time per row (s)
+//   ScoreBlockScalar/<model>/<bits>   the same with the scalar walk
+//   ScoreBlockPortable/<model>/<bits> the same with the compiled trees
 //   Predict/<model>/<bits>    BoostingModel::predict on a FeatureMap, INFO off
 //   Load/<model>              read + compile (BoostingModel construction for
 //                             this CPU's walk; the destruction of each model
 //                             is not timed)
 // gather_MB is the size of the copy of the trees that the kernel walks.
+//
+// Model texts named after the benchmark flags (engine_bench [flags]
+// m500_d6.txt ...; bench/xgboost_models.py writes trained ones) get
+// Score/, ScorePortable/, ScoreBlock/, ScoreBlockScalar/ and
+// ScoreBlockPortable/<file name>, on rows of normally distributed features
+// (those models were trained on such rows).
 #include <benchmark/benchmark.h>
 #include <glog/logging.h>
 
 #include <cmath>
+#include <fstream>
 #include <iostream>
 #include <map>
 #include <memory>
@@ -116,6 +128,122 @@ void scoreWith(benchmark::State& state, const Shape* shape, WalkKernel kernel) {
   state.counters["gather_MB"] = static_cast<double>(e.gatherBytes()) / 1e6;
 }
 
+constexpr size_t kBlockVectors = 4096;
+
+// Rows for block scoring: the fixture's vectors, repeated, or normally
+// distributed ones.
+std::vector<float> blockRows(const std::vector<std::vector<float>>& vectors, size_t length) {
+  std::vector<float> rows;
+  rows.reserve(kBlockVectors * length);
+  for (size_t r = 0; r < kBlockVectors; ++r) {
+    const std::vector<float>& x = vectors[r % vectors.size()];
+    rows.insert(rows.end(), x.begin(), x.begin() + static_cast<ptrdiff_t>(length));
+  }
+  return rows;
+}
+
+void setRowTime(benchmark::State& state, size_t rows) {
+  state.counters["row_time"] = benchmark::Counter(static_cast<double>(rows),
+                                                benchmark::Counter::kIsIterationInvariantRate |
+                                                    benchmark::Counter::kInvert);
+}
+
+template <typename Ensemble>
+void scoreBlockWith(benchmark::State& state, const Forest* forest, const std::vector<float>* rows,
+                    size_t length, WalkKernel kernel) {
+  if (!walkKernelSupported(kernel)) {
+    state.SkipWithError("this CPU cannot run the kernel");
+    return;
+  }
+  Ensemble e(kernel);
+  e.init(forest, false);
+  const size_t n = rows->size() / length;
+  std::vector<double> out(n);
+  for (auto _ : state) {
+    e.unnormalizedScores(rows->data(), n, length, out.data());
+    benchmark::DoNotOptimize(out.data());
+  }
+  setRowTime(state, n);
+  state.counters["gather_MB"] = static_cast<double>(e.gatherBytes()) / 1e6;
+}
+
+void scoreBlock(benchmark::State& state, const Shape* shape, bool sixteenBit, WalkKernel kernel) {
+  Fixture& f = fixture(*shape, sixteenBit);
+  static std::map<std::pair<const Shape*, bool>, std::vector<float>> rowsOf;
+  std::vector<float>& rows = rowsOf[{shape, sixteenBit}];
+  if (rows.empty()) rows = blockRows(f.vectors, kInputs);
+  if (sixteenBit) {
+    scoreBlockWith<FastTreeEnsembleOOP<short, unsigned>>(state, &f.forest, &rows, kInputs, kernel);
+  } else {
+    scoreBlockWith<FastTreeEnsembleOOP<int, unsigned>>(state, &f.forest, &rows, kInputs, kernel);
+  }
+}
+
+// A model text given on the command line, with normally distributed rows.
+struct FileModel {
+  std::string name;
+  std::unique_ptr<BoostingModel> model;
+  std::vector<float> rows;
+};
+
+void scoreFileRows(benchmark::State& state, const FileModel* m, WalkKernel kernel) {
+  const size_t length = m->model->vectorLength();
+  const Forest& forest = m->model->getForest();
+  if (m->model->uses16BitForest()) {
+    scoreBlockWith<FastTreeEnsembleOOP<short, unsigned>>(state, &forest, &m->rows, length, kernel);
+  } else {
+    scoreBlockWith<FastTreeEnsembleOOP<int, unsigned>>(state, &forest, &m->rows, length, kernel);
+  }
+}
+
+template <typename Ensemble>
+void scoreFileOneRow(benchmark::State& state, const FileModel* m, WalkKernel kernel) {
+  if (!walkKernelSupported(kernel)) {
+    state.SkipWithError("this CPU cannot run the kernel");
+    return;
+  }
+  Ensemble e(kernel);
+  e.init(&m->model->getForest(), false);
+  const size_t length = m->model->vectorLength();
+  std::vector<std::vector<float>> vectors;
+  for (size_t r = 0; r < 64; ++r) {
+    vectors.emplace_back(m->rows.begin() + static_cast<ptrdiff_t>(r * length),
+                         m->rows.begin() + static_cast<ptrdiff_t>((r + 1) * length));
+  }
+  size_t i = 0;
+  for (auto _ : state) benchmark::DoNotOptimize(e.unnormalizedScore(vectors[i++ % vectors.size()]));
+}
+
+void registerFileModel(const std::string& path, std::vector<std::unique_ptr<FileModel>>& models) {
+  std::ifstream in(path, std::ios::binary);
+  std::stringstream text;
+  text << in.rdbuf();
+  auto m = std::make_unique<FileModel>();
+  m->name = path.substr(path.find_last_of('/') + 1);
+  {
+    QuietStdout quiet;
+    m->model = std::make_unique<BoostingModel>(text.str());
+  }
+  std::mt19937_64 rng(11);
+  std::normal_distribution<float> normal(0.0f, 1.0f);
+  m->rows.resize(kBlockVectors * m->model->vectorLength());
+  for (float& x : m->rows) x = normal(rng);
+  const FileModel* p = m.get();
+  const bool sixteen = m->model->uses16BitForest();
+  const auto best = bestWalkKernel();
+  for (auto [name, kernel] : {std::pair{"Score/", best}, std::pair{"ScorePortable/", WalkKernel::kPortable}}) {
+    benchmark::RegisterBenchmark((name + m->name).c_str(),
+                                 sixteen ? scoreFileOneRow<FastTreeEnsembleOOP<short, unsigned>>
+                                         : scoreFileOneRow<FastTreeEnsembleOOP<int, unsigned>>,
+                                 p, kernel);
+  }
+  for (auto [name, kernel] : {std::pair{"ScoreBlock/", best}, std::pair{"ScoreBlockScalar/", WalkKernel::kScalar},
+                              std::pair{"ScoreBlockPortable/", WalkKernel::kPortable}}) {
+    benchmark::RegisterBenchmark((name + m->name).c_str(), scoreFileRows, p, kernel);
+  }
+  models.push_back(std::move(m));
+}
+
 void predict(benchmark::State& state, const Shape* shape, bool sixteenBit) {
   Fixture& f = fixture(*shape, sixteenBit);
   size_t i = 0;
@@ -156,6 +284,11 @@ int main(int argc, char** argv) {
                                      &s, kernel);
       }
       benchmark::RegisterBenchmark(("OneByOne/" + suffix).c_str(), score, &s, sixteen, false);
+      for (auto [name, kernel] : {std::pair{"ScoreBlock/", bestWalkKernel()},
+                                  std::pair{"ScoreBlockScalar/", WalkKernel::kScalar},
+                                  std::pair{"ScoreBlockPortable/", WalkKernel::kPortable}}) {
+        benchmark::RegisterBenchmark((name + suffix).c_str(), scoreBlock, &s, sixteen, kernel);
+      }
       benchmark::RegisterBenchmark(("Predict/" + suffix).c_str(), predict, &s, sixteen);
     }
   }
@@ -164,6 +297,8 @@ int main(int argc, char** argv) {
         ->Unit(benchmark::kMillisecond);
   }
   benchmark::Initialize(&argc, argv);
+  std::vector<std::unique_ptr<FileModel>> files;
+  for (int i = 1; i < argc; ++i) registerFileModel(argv[i], files);
   benchmark::AddCustomContext("cpu_flags", reliqa::bench::cpuFlags());
   benchmark::RunSpecifiedBenchmarks();
   benchmark::Shutdown();

@@ -20,6 +20,15 @@
 // equality features, trees not copied, and forests reading more than
 // kMaxGatherFeatures positions take the walks of the compiled trees.
 //
+// unnormalizedScores() scores rows a block at a time, sorted by the sub-model
+// that each row selects, and walks each tree over the whole block while its
+// nodes are in cache. Where the CPU has AVX-512 it walks the complete trees
+// with kBlockRows rows in the vector lanes (CompleteBlockWalk.h), so init()
+// lays the trees out as complete trees too; with kScalar it runs the scalar
+// walk of complete trees row after row, group by group; otherwise, and for
+// the trees that the layout leaves out, it walks the compiled trees with
+// kRowsInStep rows in lock step.
+//
 // Threads: init() once, then any number of threads may score concurrently;
 // useWalkKernel() is part of setting up, like init().
 #pragma once
@@ -39,6 +48,7 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/CompleteBlockWalk.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/CompleteTreeWalk.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsembleSimd.h"
@@ -84,6 +94,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   // The gather kernels read a copy of the features on the stack.
   static constexpr size_t kMaxGatherFeatures = 1023;
   static_assert(kMaxGatherFeatures <= kWalkMaxFeature, "the NaN slot must fit a WalkNode");
+  static_assert(kMaxGatherFeatures < 4096, "vectors that the kernels lay out are copied by blocks");
 
   bool init(const Forest* forest, bool remap) override;
 
@@ -98,6 +109,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   double score(const std::vector<float>& features) const override {
     return logistic(unnormalizedScore(features));
   }
+  void unnormalizedScores(const float* rows, size_t numRows, size_t rowStride, double* out) const override;
   double unnormalizedScoreOneByOne(const std::vector<float>& features) const override {
     checkLength(features);
     const float* x = features.data();
@@ -126,8 +138,12 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   }
   // Bytes held by the copy of the trees that the current kernel walks (0 for
   // kPortable, or when the kernel takes none of the trees).
+  // With kAvx512 that is the walk nodes and the complete trees of the block
+  // walk.
   size_t gatherBytes() const {
-    return kernel_ == WalkKernel::kScalar ? complete_.bytes() : kernel_ == WalkKernel::kAvx512 ? walk_.bytes() : 0;
+    return kernel_ == WalkKernel::kScalar   ? complete_.bytes()
+           : kernel_ == WalkKernel::kAvx512 ? walk_.bytes() + complete_.bytes()
+                                            : 0;
   }
 
   // The range [first, end) of trees that the selector chooses for `features`.
@@ -330,6 +346,135 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   static bool gatherable(const FlatTree& tree);
   void buildWalkCopy();
 
+  // Rows that the compiled-tree walk of a block moves in lock step.
+  static constexpr size_t kRowsInStep = 16;
+  // Rows sorted by sub-model at a time.
+  static constexpr size_t kWindow = 4 * kBlockRows;
+  // Widest vector whose rows the compiled-tree walk of a block copies out by
+  // feature; wider ones are walked a row at a time.
+  static constexpr size_t kMaxBlockCopy = 4096;
+
+  // One step of a row in a block copied out by feature: x points at the
+  // row's value of feature 0, and feature f is kBlockRows floats further per
+  // f; a leaf (feature -1) reads the row before feature 0, which exists, and
+  // keeps its index. The rules are those of step().
+  template <bool kRoot, bool kMasked>
+  static uint32_t stepInBlock(const FlatNode* nodes, uint32_t index, const float* x) {
+    const FlatNode& n = nodes[index];
+    const auto f = static_cast<ptrdiff_t>(n.featureId);
+    const float v = x[f * static_cast<ptrdiff_t>(kBlockRows)];
+    const uint32_t second = kRoot ? static_cast<uint32_t>(!(v <= n.value)) : static_cast<uint32_t>(v > n.value);
+    const uint32_t next = static_cast<uint32_t>(n.child) + second;
+    return kMasked && f == kLeaf ? index : next;
+  }
+
+  // Adds the leaf of `tree` to sums[k] for rows[0, n). `byFeature` is the
+  // block copied out by feature (byFeature[f * kBlockRows + k] is feature f
+  // of row k, rows past n repeating row 0, up to the next multiple of
+  // kRowsInStep), or null; with it the compiled nodes are walked by
+  // kRowsInStep rows in lock step (rows that reach a leaf early stay there,
+  // as in walkBlock()).
+  void addTreeToRows(const FlatTree& tree, const float* const* rows, const float* byFeature, size_t n,
+                     double* sums) const {
+    const FlatNode* nodes = tree.nodes.data();
+    if (byFeature == nullptr || tree.hasEqualityFeature || nodes[0].featureId == kLeaf) {
+      for (size_t k = 0; k < n; ++k) sums[k] += static_cast<double>(leafValue(tree, rows[k]));
+      return;
+    }
+    const uint32_t rounds = tree.depth;
+    const uint32_t unmasked = std::min(tree.leafDepth, rounds);
+    for (size_t r0 = 0; r0 < n; r0 += kRowsInStep) {
+      const float* x = byFeature + r0;
+      uint32_t index[kRowsInStep];
+#pragma GCC unroll 16
+      for (size_t k = 0; k < kRowsInStep; ++k) index[k] = stepInBlock<true, false>(nodes, 0, x + k);
+      uint32_t r = 1;
+      for (; r < unmasked; ++r) {
+#pragma GCC unroll 16
+        for (size_t k = 0; k < kRowsInStep; ++k) index[k] = stepInBlock<false, false>(nodes, index[k], x + k);
+      }
+      for (; r < rounds; ++r) {
+#pragma GCC unroll 16
+        for (size_t k = 0; k < kRowsInStep; ++k) index[k] = stepInBlock<false, true>(nodes, index[k], x + k);
+      }
+      const size_t m = std::min(kRowsInStep, n - r0);
+      for (size_t k = 0; k < m; ++k) sums[r0 + k] += static_cast<double>(nodes[index[k]].value);
+    }
+  }
+
+  // Copies rows[0, n) out by feature for addTreeToRows() into `buffer`
+  // (kBlockRows * (requiredFeatures_ + 1) floats), after a row of zeros that
+  // leaves read; returns the start of feature 0, or null when the rows are
+  // too wide to copy.
+  const float* copyByFeature(const float* const* rows, size_t n, float* buffer) const {
+    if (requiredFeatures_ > kMaxBlockCopy) return nullptr;
+    std::fill(buffer, buffer + kBlockRows, 0.0f);
+    float* out = buffer + kBlockRows;
+    const size_t filled = (n + kRowsInStep - 1) / kRowsInStep * kRowsInStep;
+    for (size_t k = 0; k < filled; ++k) {
+      const float* x = rows[k < n ? k : 0];
+      for (size_t f = 0; f < requiredFeatures_; ++f) out[f * kBlockRows + k] = x[f];
+    }
+    return out;
+  }
+
+  bool takenByLayout(size_t tree) const {
+    return complete_.taken[tree / kCompleteGroup] >> (tree % kCompleteGroup) & 1;
+  }
+
+  // Scores rows[0, n) (n <= kBlockRows), all of which select trees
+  // [first, end), into sums[0, n). `keys` has room for the block's keys, or
+  // for its rows copied by feature; it is empty for vectors wider than
+  // kMaxBlockCopy, which no kernel lays out.
+  void scoreBlock(const float* const* rows, size_t n, size_t first, size_t end, uint32_t* keys,
+                  double* sums) const {
+    std::fill(sums, sums + n, baseScore_);
+    const size_t slots = requiredFeatures_ + 1;
+    if (kernel_ == WalkKernel::kAvx512 && !complete_.empty()) {
+      alignas(64) double lanes[kBlockRows];
+      std::fill(lanes, lanes + kBlockRows, baseScore_);
+      completeBlockKeys(rows, n, slots, keys);
+      for (size_t i = first; i < end;) {
+        if (!takenByLayout(i)) {
+          addTreeToRows(trees_[i], rows, nullptr, n, lanes);
+          ++i;
+          continue;
+        }
+        size_t j = i + 1;
+        while (j < end && takenByLayout(j)) ++j;
+        sumCompleteRows(complete_, i, j, slots, keys, lanes);
+        i = j;
+      }
+      std::copy(lanes, lanes + n, sums);
+      return;
+    }
+    if (kernel_ == WalkKernel::kScalar && !complete_.empty()) {
+      for (size_t k = 0; k < n; ++k) completeKeys(rows[k], slots, keys + 2 * slots * k);
+      const size_t endGroup = (end + kCompleteGroup - 1) / kCompleteGroup;
+      for (size_t g = first / kCompleteGroup; g < endGroup; ++g) {
+        const size_t base = g * kCompleteGroup;
+        if (complete_.taken[g] == kCompleteAllTaken && base >= first && base + kCompleteGroup <= end) {
+          for (size_t k = 0; k < n; ++k) {
+            sums[k] = thornvale::sumComplete(complete_, g, g + 1, keys + 2 * slots * k, sums[k]);
+          }
+          continue;
+        }
+        const size_t lo = std::max(first, base), hi = std::min(end, base + kCompleteGroup);
+        for (size_t k = 0; k < n; ++k) {
+          float leaves[kCompleteGroup];
+          walkComplete(complete_, g, g + 1, keys + 2 * slots * k, leaves);
+          for (size_t i = lo; i < hi; ++i) {
+            if (takenByLayout(i)) sums[k] += static_cast<double>(leaves[i - base]);
+            else sums[k] += static_cast<double>(leafValue(trees_[i], rows[k]));
+          }
+        }
+      }
+      return;
+    }
+    const float* byFeature = copyByFeature(rows, n, reinterpret_cast<float*>(keys));
+    for (size_t i = first; i < end; ++i) addTreeToRows(trees_[i], rows, byFeature, n, sums);
+  }
+
   // The features, the NaN slot at position requiredFeatures_, and NaN up to a
   // multiple of 32 entries (the vector kernel loads whole registers).
   using FeatureBuffer = float[(kMaxGatherFeatures + 32) / 32 * 32];
@@ -462,6 +607,46 @@ bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::init(const Forest* forest, boo
 }
 
 template <typename FeatureIdT, typename NodeIndexT>
+void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::unnormalizedScores(const float* rows, size_t numRows,
+                                                                     size_t rowStride, double* out) const {
+  if (numRows == 0) return;
+  if (rowStride < requiredFeatures_) {
+    throw std::invalid_argument("rows are " + std::to_string(rowStride) +
+                                " entries apart but the compiled forest reads position " +
+                                std::to_string(requiredFeatures_ - 1));
+  }
+  const size_t slots = requiredFeatures_ + 1;
+  std::vector<uint32_t> keys(
+      requiredFeatures_ <= kMaxBlockCopy ? std::max(completeBlockKeyWords(slots), 2 * slots * kBlockRows) : 0);
+  static_assert(sizeof(float) == sizeof(uint32_t), "the rows copied by feature fit the keys");
+  // Rows of a window, sorted by the range of trees they select, go to the
+  // walks in blocks of one range each.
+  const float* row[kWindow];
+  std::pair<size_t, size_t> range[kWindow];
+  uint32_t order[kWindow];
+  const float* block[kBlockRows];
+  alignas(64) double sums[kBlockRows];
+  for (size_t w = 0; w < numRows; w += kWindow) {
+    const size_t count = std::min(kWindow, numRows - w);
+    for (size_t k = 0; k < count; ++k) {
+      row[k] = rows + (w + k) * rowStride;
+      range[k] = selectModel(row[k]);
+      order[k] = static_cast<uint32_t>(k);
+    }
+    if (!selector_.nodes.empty()) {
+      std::stable_sort(order, order + count, [&](uint32_t a, uint32_t b) { return range[a] < range[b]; });
+    }
+    for (size_t k = 0; k < count;) {
+      const std::pair<size_t, size_t> r = range[order[k]];
+      size_t n = 0;
+      for (; k < count && n < kBlockRows && range[order[k]] == r; ++k, ++n) block[n] = row[order[k]];
+      scoreBlock(block, n, r.first, r.second, keys.data(), sums);
+      for (size_t i = 0; i < n; ++i) out[w + order[k - n + i]] = sums[i];
+    }
+  }
+}
+
+template <typename FeatureIdT, typename NodeIndexT>
 bool FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::gatherable(const FlatTree& tree) {
   return !tree.hasEqualityFeature && tree.depth <= kMaxGatherDepth &&
          tree.nodes.size() <= kWalkMaxDistance;
@@ -473,7 +658,10 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::buildWalkCopy() {
   const auto nanSlot = static_cast<uint32_t>(requiredFeatures_);
   if (kernel_ == WalkKernel::kAvx512 && walk_.empty()) {
     walk_ = buildWalkForest(trees_, kLeaf, nanSlot, gatherable);
-  } else if (kernel_ == WalkKernel::kScalar && complete_.empty()) {
+  }
+  // The block walk of the vector kernel walks complete trees.
+  const bool blockWalk = kernel_ == WalkKernel::kAvx512 && completeBlockSupported();
+  if ((kernel_ == WalkKernel::kScalar || blockWalk) && complete_.empty()) {
     complete_ = buildCompleteForest(trees_, kLeaf, nanSlot,
                                     [](const FlatTree& tree) { return !tree.hasEqualityFeature; });
   }

@@ -27,7 +27,13 @@
 // a negative one is kept as position 0) and unnormalizedScoreOfZeros() gives
 // the one score such a model can have. It throws std::runtime_error for a
 // tree with an absent node. Scoring a vector shorter than
-// requiredFeatures() throws std::invalid_argument.
+// requiredFeatures() throws std::invalid_argument, and so does scoring rows
+// whose stride is shorter.
+//
+// unnormalizedScores() scores a block of rows at once: out[r] is, bit for
+// bit, unnormalizedScore() of row r. It walks each group of trees over many
+// rows while the group's nodes are in cache, and adds every row's leaves in
+// tree order, as the one-row walk does.
 //
 // Remapping (init with remap = true) translates each split position through
 // featureMapping; the vector is then indexed by feature id, and the equality
@@ -58,6 +64,14 @@ class FastTreeEnsemble {
   virtual double unnormalizedScore(const std::vector<FeatureT>& features) const = 0;
   virtual double score(const std::vector<FeatureT>& features) const = 0;
   virtual ~FastTreeEnsemble() = default;
+
+  // Raw scores of `numRows` rows: row r starts at rows + r * rowStride and
+  // is read up to requiredFeatures() (rowStride >= requiredFeatures()), and
+  // out[r] gets unnormalizedScore() of that row, bit for bit. The caller owns
+  // both arrays; `out` has numRows entries. Throws std::invalid_argument for
+  // a stride below requiredFeatures() when there are rows.
+  virtual void unnormalizedScores(const FeatureT* rows, size_t numRows, size_t rowStride,
+                                  double* out) const = 0;
 
   // The same sum as unnormalizedScore(), bit for bit, walking one tree after
   // another.

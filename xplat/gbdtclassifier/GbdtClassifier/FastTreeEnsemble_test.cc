@@ -427,6 +427,96 @@ TEST(Kernels, AllKernelsGiveTheOneByOneSum32) {
   for (int32_t features : {3, 32, 64, 96, 128, 1000}) checkKernels<Forest32>(features + 7, features);
 }
 
+// Block scoring must give every row the one-row score, bit for bit, with
+// every kernel: row counts of none, one, and past the block and the window
+// that is sorted by sub-model without being multiples of them; strides longer
+// than the rows (the extra entries hold values that would change the score
+// were they read); rows that select different sub-models, one of them empty;
+// plain and equality trees, single leaves, and trees too deep for the group
+// walks; inputs on thresholds, NaN, infinities and signed zeros.
+template <typename E>
+void checkBlocks(uint64_t seed, int32_t numFeatures) {
+  std::vector<WalkKernel> kernels{WalkKernel::kPortable, WalkKernel::kScalar};
+  if (walkKernelSupported(WalkKernel::kAvx512)) kernels.push_back(WalkKernel::kAvx512);
+  std::mt19937_64 rng(seed);
+  for (int round = 0; round < 4; ++round) {
+    const size_t count = 40 + rng() % 300;
+    const int depth = 1 + static_cast<int>(rng() % 9);
+    Forest f = test::randomForest(rng(), count, depth, numFeatures, false, round % 2 ? 0.3 : 0.0);
+    for (size_t i = 0; i < count; i += 1 + rng() % 24) {
+      switch (rng() % 3) {
+        case 0: f.trees[i].tree->root = leaf(0.25 * static_cast<double>(i)); break;
+        case 1: f.trees[i].tree->root = test::randomFullTree(rng, 10, numFeatures, 0.5); break;
+        default: f.trees[i].tree->root = test::chain(E::kMaxGatherDepth + 1 + rng() % 3, numFeatures - 1);
+      }
+    }
+    f.trees.push_back(weighted(split(1, 0.5, leaf(0.125), leaf(-0.125)), 1));
+    if (round % 2 == 0) f.equalityFeatures = {0};
+    if (round >= 1) {  // models 0 to 3, model 2 empty; 3.5 and NaN pick models 3 and 0
+      f.modelSelector =
+          weighted(split(1, 0.0, split(2, 0.0, leaf(0.5), leaf(1.5)), split(2, 0.0, leaf(2.5), leaf(3.5))), 1);
+      const auto a = static_cast<uint32_t>(count / 3);
+      f.modelIndexMap = {a, a + 37, a + 37};
+    }
+    auto e = compiled<E>(f);
+    ASSERT_EQ(e->gatherBytes() > 0, numFeatures < 1000) << "round " << round;
+    std::vector<float> values;  // thresholds and special values
+    for (const auto& t : e->getTrees()) {
+      for (const auto& n : t.nodes) {
+        if (n.featureId != E::kLeaf) values.push_back(n.value);
+      }
+    }
+    for (float special : {kNaN, std::numeric_limits<float>::infinity(), -std::numeric_limits<float>::infinity(),
+                          0.0f, -0.0f}) {
+      values.insert(values.end(), 8, special);
+    }
+    const size_t stride = static_cast<size_t>(numFeatures) + (round == 0 ? 0 : 1 + rng() % 5);
+    const size_t kRows = 300;
+    std::uniform_real_distribution<float> u(-1.2f, 1.2f);
+    std::vector<float> rows(kRows * stride, kNaN);
+    for (size_t r = 0; r < kRows; ++r) {
+      for (size_t i = 0; i < static_cast<size_t>(numFeatures); ++i) {
+        rows[r * stride + i] = rng() % 3 == 0 ? values[rng() % values.size()] : u(rng);
+      }
+      if (r % 4 == 0) rows[r * stride + static_cast<size_t>(numFeatures) - 1] = 100.0f;  // deep chains to the end
+    }
+    for (WalkKernel k : kernels) {
+      ASSERT_TRUE(e->useWalkKernel(k));
+      for (size_t n : {size_t{0}, size_t{1}, size_t{kBlockRows + 3}, kRows}) {
+        std::vector<double> out(n + 1, -7.0);
+        e->unnormalizedScores(rows.data(), n, stride, out.data());
+        for (size_t r = 0; r < n; ++r) {
+          const std::vector<float> x(rows.begin() + static_cast<ptrdiff_t>(r * stride),
+                                     rows.begin() + static_cast<ptrdiff_t>((r + 1) * stride));
+          ASSERT_TRUE(test::sameBits(out[r], e->unnormalizedScore(x)))
+              << "kernel " << static_cast<int>(k) << ", round " << round << ", row " << r << " of " << n;
+        }
+        EXPECT_EQ(out[n], -7.0);  // nothing written past the rows
+      }
+    }
+  }
+}
+
+TEST(Blocks, EveryRowGetsItsOneRowScore16) {
+  for (int32_t features : {3, 74, 130}) checkBlocks<Forest16>(features, features);
+}
+TEST(Blocks, EveryRowGetsItsOneRowScore32) {
+  for (int32_t features : {5, 33, 1100}) checkBlocks<Forest32>(features + 11, features);
+}
+
+TEST(Blocks, StrideShorterThanTheVectorThrows) {
+  Forest f = mapped(4);
+  f.trees.push_back(weighted(split(3, 0.5, leaf(1), leaf(2)), 1));
+  auto e = compiled(f);
+  const std::vector<float> rows(8, 1.0f);
+  double out[2];
+  EXPECT_THROW(e->unnormalizedScores(rows.data(), 2, 3, out), std::invalid_argument);
+  e->unnormalizedScores(rows.data(), 0, 3, out);  // no rows, nothing read
+  e->unnormalizedScores(rows.data(), 2, 4, out);
+  EXPECT_EQ(out[0], 2.0);
+  EXPECT_EQ(out[1], 2.0);
+}
+
 TEST(Kernels, ForestsWithoutGroupWalk) {
   // Leaves only: nothing is read from the (empty) vector.
   Forest leaves;

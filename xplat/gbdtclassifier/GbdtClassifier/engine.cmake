@@ -7,7 +7,8 @@ add_library(gbdt STATIC
   BoostingModel/ModelWriter.cc
   BoostingModel/BoostingModel.cc
   FastTreeEnsembleSimd.cc
-  CompleteTreeWalk.cc)
+  CompleteTreeWalk.cc
+  CompleteBlockWalk.cc)
 target_include_directories(gbdt PUBLIC ${PROJECT_SOURCE_DIR})
 target_link_libraries(gbdt PUBLIC feature_map glog::glog)
 

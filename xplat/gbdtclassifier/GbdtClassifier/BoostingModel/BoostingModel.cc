@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <sstream>
+#include <stdexcept>
 #include <string_view>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
@@ -120,6 +121,19 @@ double BoostingModel::rawScore(const FeatureMap& features) const {
   std::vector<float> vector;
   fillVector(features, vector);
   return ensemble_->unnormalizedScore(vector);
+}
+
+void BoostingModel::rawScores(const float* vectors, size_t numRows, size_t stride, double* out) const {
+  if (numRows == 0) return;
+  if (stride < vectorLength_) {
+    throw std::invalid_argument("feature vectors are " + std::to_string(stride) + " floats apart but hold " +
+                                std::to_string(vectorLength_) + " features");
+  }
+  if (constantScore_) {
+    std::fill(out, out + numRows, constantRawScore_);
+    return;
+  }
+  ensemble_->unnormalizedScores(vectors, numRows, stride, out);
 }
 
 double BoostingModel::predict(const FeatureMap& features) const {

@@ -18,12 +18,20 @@
 // model without featureMapping cannot see any feature, so its one raw score
 // is computed at construction and returned for every map.
 //
+// rawScores() scores many rows that are already feature vectors (what
+// featureVector() gives, vectorLength() floats in featureMapping order),
+// a block at a time (FastTreeEnsemble::unnormalizedScores()): out[r] is, bit
+// for bit, rawScore() of the map whose vector row r is. A model without
+// featureMapping fills its constant score. It throws std::invalid_argument
+// when the stride is shorter than vectorLength() and there are rows.
+//
 // Owns its Forest and compiled forest. The Forest's nodes live in the
 // model's own arena and are freed with it all at once, without their
 // destructors. getForest()'s const does not reach through the Forest's
 // pointers, but no node may be taken out of it (it would not outlive the
 // model) or put into it (it would never be freed). Immutable after
-// construction: predict() and rawScore() may run on several threads at once.
+// construction: predict(), rawScore() and rawScores() may run on several
+// threads at once.
 //
 // The compiled forest is seen through its interface (FastTreeEnsemble.h);
 // its implementation (FastTreeEnsemble-inl.h) is compiled in
@@ -60,6 +68,12 @@ class BoostingModel {
   // The float vector that `features` become (empty for a model without
   // featureMapping).
   std::vector<float> featureVector(const FeatureMap& features) const;
+  // Length of featureVector(): the number of featureMapping entries.
+  size_t vectorLength() const { return vectorLength_; }
+  // Raw scores of `numRows` feature vectors: row r is vectors[r * stride,
+  // r * stride + vectorLength()), stride >= vectorLength(); out has numRows
+  // entries. Both arrays stay the caller's.
+  void rawScores(const float* vectors, size_t numRows, size_t stride, double* out) const;
 
   const Forest& getForest() const { return *forest_; }
   const FastTreeEnsemble<float>& getEnsemble() const { return *ensemble_; }

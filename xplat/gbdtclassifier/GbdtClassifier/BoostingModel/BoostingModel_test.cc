@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <limits>
 #include <thread>
@@ -138,6 +139,56 @@ TEST(ConstantModels, NoFeatureMappingScoresZerosOnce) {
   EXPECT_EQ(model->rawScore({}), 0.125 + 2 + 8);
   EXPECT_EQ(model->rawScore({{0, 100.0}, {5, -100.0}}), 0.125 + 2 + 8);
   EXPECT_EQ(model->predict({}), logistic(0.125 + 2 + 8));
+}
+
+// rawScores() of feature vectors must be rawScore() of the maps they come
+// from, bit for bit, for both forest widths and every kernel, with a stride
+// longer than the vector; a model without featureMapping fills its constant.
+TEST(BlockScores, RowsScoreAsTheirMaps) {
+  FLAGS_minloglevel = google::GLOG_WARNING;
+  std::vector<WalkKernel> kernels{WalkKernel::kPortable, WalkKernel::kScalar};
+  if (walkKernelSupported(WalkKernel::kAvx512)) kernels.push_back(WalkKernel::kAvx512);
+  for (bool withKeys : {true, false}) {
+    Forest f = test::randomForest(withKeys ? 3 : 4, 150, 6, 30, withKeys, 0.2);
+    f.equalityFeatures = {4};
+    const std::string text = writeModel(f, 4);
+    std::vector<FeatureMap> maps(97);
+    for (size_t r = 0; r < maps.size(); ++r) {
+      for (int32_t id = 1; id <= 30; ++id) {
+        if ((r + static_cast<size_t>(id)) % 7 != 0) maps[r].emplace(id, std::sin(static_cast<double>(r * 31 + id)));
+      }
+      maps[r].emplace(1000, 5.0);  // not a model feature
+    }
+    for (WalkKernel kernel : kernels) {
+      test::StdoutCapture discarded;
+      BoostingModel model(text, kernel);
+      ASSERT_EQ(model.vectorLength(), 30u);
+      ASSERT_EQ(model.uses16BitForest(), withKeys);
+      const size_t stride = 33;
+      std::vector<float> rows(maps.size() * stride, std::numeric_limits<float>::quiet_NaN());
+      for (size_t r = 0; r < maps.size(); ++r) {
+        const std::vector<float> x = model.featureVector(maps[r]);
+        std::copy(x.begin(), x.end(), rows.begin() + static_cast<ptrdiff_t>(r * stride));
+      }
+      std::vector<double> out(maps.size());
+      model.rawScores(rows.data(), maps.size(), stride, out.data());
+      for (size_t r = 0; r < maps.size(); ++r) {
+        ASSERT_EQ(out[r], model.rawScore(maps[r])) << "kernel " << static_cast<int>(kernel) << ", row " << r;
+      }
+      EXPECT_THROW(model.rawScores(rows.data(), 1, 29, out.data()), std::invalid_argument);
+    }
+  }
+
+  Forest constant;
+  constant.baseScore = 0.125;
+  constant.trees.push_back(weighted(split(7, 0.0, leaf(8), leaf(16)), 1));
+  auto model = load(constant, 2);
+  ASSERT_TRUE(model->hasConstantScore());
+  EXPECT_EQ(model->vectorLength(), 0u);
+  double out[3] = {0, 0, 0};
+  model->rawScores(nullptr, 3, 0, out);
+  EXPECT_THAT(out, ElementsAre(0.125 + 8, 0.125 + 8, 0.125 + 8));
+  FLAGS_minloglevel = google::GLOG_INFO;
 }
 
 TEST(Failures, ReaderAndCompilerErrorsLeaveTheConstructor) {
