@@ -43,7 +43,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     if (model.featureNames.empty() && model.numFeature <= 1000) {
       for (int64_t i = 1; i <= model.numFeature; ++i) given.push_back(i);
     }
-    std::vector<int32_t> ids = reliqa::tool::featureIdsOf(model, given, "fuzz");
+    std::vector<int32_t> ids = reliqa::tool::featureIdsOf(model, given, "fuzz", "--feature-ids");
     forest = reliqa::tool::toForest(model, ids);
   } catch (const reliqa::tool::ToolError& e) {
     int64_t lines = 1;

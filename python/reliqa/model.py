@@ -36,12 +36,14 @@ class Model:
         When the text is not a model the library can load.
     """
 
-    def __init__(self, text: Union[str, bytes], *, _name: str = "the model text") -> None:
+    def __init__(self, text: Union[str, bytes], *, _name: str = "the model text", _walk: str = "") -> None:
+        # _walk ("portable", "scalar", "avx512") forces one way of walking the
+        # trees, for benchmarks; every walk gives the same bits.
         if isinstance(text, str):
             text = text.encode("utf-8")
         if not isinstance(text, (bytes, bytearray, memoryview)):
             raise TypeError(f"a model text is str or bytes, not {type(text).__name__}")
-        self._native = _native.Model(bytes(text), _name)
+        self._native = _native.Model(bytes(text), _name, _walk)
 
     @classmethod
     def load(cls, path: PathLike) -> "Model":

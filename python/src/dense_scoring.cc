@@ -48,18 +48,10 @@ void fillBlock(const Matrix& x, const std::vector<int64_t>& columns, std::option
   }
 }
 
-void rawScores(const thornvale::BoostingModel& model, const float* block, size_t n, size_t length, double* out) {
-  std::vector<float> vector(length);
-  for (size_t r = 0; r < n; ++r) {
-    std::copy(block + r * length, block + (r + 1) * length, vector.begin());
-    out[r] = model.getEnsemble().unnormalizedScore(vector);
-  }
-}
-
 void scoreRange(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
                 std::optional<double> missing, bool probability, size_t first, size_t end, double* out) {
-  if (model.hasConstantScore()) {
-    std::fill(out + first, out + end, model.rawScore(thornvale::FeatureMap{}));
+  if (model.vectorLength() == 0) {
+    model.rawScores(nullptr, end - first, 0, out + first);
   } else {
     const size_t length = columns.size();
     std::vector<float> block(kBlockRows * length);
@@ -70,7 +62,7 @@ void scoreRange(const thornvale::BoostingModel& model, const Matrix& x, const st
       } else {
         fillBlock<float>(x, columns, missing, at, n, block.data());
       }
-      rawScores(model, block.data(), n, length, out + at);
+      model.rawScores(block.data(), n, length, out + at);
     }
   }
   if (probability) {

@@ -32,6 +32,7 @@
 #include "tools/common/xgboost_model.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/WalkKernel.h"
 
 namespace py = pybind11;
 
@@ -57,9 +58,34 @@ class QuietStdout {
   std::streambuf* saved_;
 };
 
-std::unique_ptr<thornvale::BoostingModel> readModel(const std::string& text, const std::string& name) {
+// The walk named `walk` ("" for the best one this CPU runs).
+thornvale::WalkKernel walkNamed(const std::string& walk) {
+  if (walk.empty()) return thornvale::bestWalkKernel();
+  thornvale::WalkKernel kernel;
+  if (walk == "portable") {
+    kernel = thornvale::WalkKernel::kPortable;
+  } else if (walk == "scalar") {
+    kernel = thornvale::WalkKernel::kScalar;
+  } else if (walk == "avx512") {
+    kernel = thornvale::WalkKernel::kAvx512;
+  } else {
+    throw std::invalid_argument("walk must be 'portable', 'scalar' or 'avx512', got '" + walk + "'");
+  }
+  if (!thornvale::walkKernelSupported(kernel)) {
+    throw std::invalid_argument("this CPU cannot run the " + walk + " walk");
+  }
+  return kernel;
+}
+
+std::unique_ptr<thornvale::BoostingModel> readModel(const std::string& text, const std::string& name,
+                                                    const std::string& walk) {
+  const thornvale::WalkKernel kernel = walkNamed(walk);
   QuietStdout quiet;
-  return tool::loadModel(name, text);
+  try {
+    return std::make_unique<thornvale::BoostingModel>(text, kernel);
+  } catch (const std::exception& e) {
+    throw tool::ToolError(name, 0, std::string("the model cannot be loaded: ") + e.what());
+  }
 }
 
 // A Python int or decimal string as a signed 32-bit feature id.
@@ -103,10 +129,18 @@ bool isAbsent(double v, std::optional<double> missing) {
 
 class Model {
  public:
-  Model(std::string text, std::string name) : text_(std::move(text)), model_(readModel(text_, name)) {}
+  // `walk` picks how the trees are walked ("" for the best walk; every walk
+  // gives the same bits, so it matters only to benchmarks).
+  Model(std::string text, std::string name, const std::string& walk)
+      : text_(std::move(text)), model_(readModel(text_, name, walk)) {}
 
   static Model fromXgboost(const std::string& json, const std::string& name, const std::vector<int64_t>& ids) {
-    return Model(tool::convertXgboostJson(json, name, ids).text, name);
+    std::string text;
+    {
+      QuietStdout quiet;  // the conversion reads its model back
+      text = tool::convertXgboostJson(json, name, ids, "feature_ids=[...]").text;
+    }
+    return Model(std::move(text), name, "");
   }
 
   py::bytes text() const { return py::bytes(text_); }
@@ -343,7 +377,8 @@ PYBIND11_MODULE(_native, m) {
   });
 
   py::class_<Model>(m, "Model")
-      .def(py::init<std::string, std::string>(), py::arg("text"), py::arg("name"))
+      .def(py::init<std::string, std::string, std::string>(), py::arg("text"), py::arg("name"),
+           py::arg("walk") = "")
       .def_static("from_xgboost", &Model::fromXgboost, py::arg("json"), py::arg("name"), py::arg("feature_ids"))
       .def_property_readonly("text", &Model::text)
       .def_property_readonly("feature_ids", &Model::featureIds)

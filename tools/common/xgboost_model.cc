@@ -390,13 +390,14 @@ std::vector<int64_t> parseIdList(const std::vector<std::string>& items) {
   return ids;
 }
 
-std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64_t>& given, const std::string& name) {
+std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64_t>& given, const std::string& name,
+                                  const std::string& option) {
   std::vector<int64_t> ids = given;
   if (ids.empty()) {
     if (model.featureNames.empty()) {
       throw ToolError(name, 0,
                       "the model has no feature names, so its feature ids are unknown; give one id per feature "
-                      "with --feature-ids 1,2,... (" + std::to_string(model.numFeature) + " ids)");
+                      "with " + option + " (" + std::to_string(model.numFeature) + " ids)");
     }
     for (const std::string& n : model.featureNames) {
       // As long as the longest 32-bit id ("-2147483648") at most; the range
@@ -406,14 +407,14 @@ std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64
       if (error != std::errc() || end != n.data() + n.size() || n.size() > 11) {
         throw ToolError(name, 0,
                         "feature name " + quoteForMessage(n) +
-                            " is not an integer feature id; give one id per feature with --feature-ids 1,2,... (" +
+                            " is not an integer feature id; give one id per feature with " + option + " (" +
                             std::to_string(model.numFeature) + " ids, in the order of the model's features)");
       }
       ids.push_back(id);
     }
   } else if (static_cast<int64_t>(ids.size()) != model.numFeature) {
-    throw UsageError("--feature-ids gives " + std::to_string(ids.size()) + " ids but the model has " +
-                     std::to_string(model.numFeature) + " features");
+    throw ToolError(name, 0, option.substr(0, option.find(' ')) + " gives " + std::to_string(ids.size()) +
+                                 " ids but the model has " + std::to_string(model.numFeature) + " features");
   }
   std::vector<int32_t> out;
   std::set<int32_t> seen;
@@ -467,10 +468,10 @@ std::unique_ptr<thornvale::Forest> toForest(const XgbModel& model, const std::ve
 }
 
 ConvertedModel convertXgboostJson(std::string_view json, const std::string& name,
-                                  const std::vector<int64_t>& featureIds) {
+                                  const std::vector<int64_t>& featureIds, const std::string& option) {
   const XgbModel xgb = readXgboostModel(json, name);
   ConvertedModel out;
-  out.featureIds = featureIdsOf(xgb, featureIds, name);
+  out.featureIds = featureIdsOf(xgb, featureIds, name, option);
   out.trees = xgb.trees.size();
   const std::unique_ptr<thornvale::Forest> forest = toForest(xgb, out.featureIds);
   try {

@@ -54,9 +54,10 @@ XgbModel readXgboostModel(std::string_view json, const std::string& name);
 
 // The feature ids of the XGBoost features: `given` (one per feature) or, when
 // empty, the integers of the feature names. Throws ToolError (naming `name`)
-// when neither gives distinct 32-bit ids.
+// when neither gives distinct 32-bit ids; its message tells how to give them
+// with `option` (the front end's way: "--feature-ids 1,2,...").
 std::vector<int32_t> featureIdsOf(const XgbModel& model, const std::vector<int64_t>& given,
-                                  const std::string& name);
+                                  const std::string& name, const std::string& option);
 
 std::unique_ptr<thornvale::Forest> toForest(const XgbModel& model, const std::vector<int32_t>& featureIds);
 
@@ -69,9 +70,10 @@ struct ConvertedModel {
 
 // The whole conversion: reads and checks `json`, maps its features to
 // `featureIds` (see featureIdsOf), converts, writes the newest format and
-// makes sure that the text loads. Throws ToolError naming `name`.
+// makes sure that the text loads. Throws ToolError naming `name`; `option`
+// is as for featureIdsOf().
 ConvertedModel convertXgboostJson(std::string_view json, const std::string& name,
-                                  const std::vector<int64_t>& featureIds);
+                                  const std::vector<int64_t>& featureIds, const std::string& option);
 
 // The ids of --feature-ids, one item each as the option splits its text at
 // commas: an optional sign and at most 18 decimal digits, with spaces around;

@@ -41,7 +41,7 @@ std::string model(const std::string& trees = std::string(kTree0) + "," + kTree1,
 std::string errorOf(const std::string& json, std::vector<int64_t> ids = {}) {
   try {
     XgbModel m = readXgboostModel(json, "m.json");
-    featureIdsOf(m, ids, "m.json");
+    featureIdsOf(m, ids, "m.json", "--feature-ids");
   } catch (const ToolError& e) {
     return e.describe();
   }
@@ -51,7 +51,7 @@ std::string errorOf(const std::string& json, std::vector<int64_t> ids = {}) {
 TEST(XgboostModel, ConvertsTreesBaseScoreAndFeatureMetadata) {
   XgbModel m = readXgboostModel(model(), "m.json");
   ASSERT_EQ(m.trees.size(), 2u);
-  std::vector<int32_t> ids = featureIdsOf(m, {}, "m.json");
+  std::vector<int32_t> ids = featureIdsOf(m, {}, "m.json", "--feature-ids");
   EXPECT_EQ(ids, (std::vector<int32_t>{5, 7, 9}));
   auto forest = toForest(m, ids);
   double p = 0.3f;  // XGBoost keeps base_score as a float
@@ -87,7 +87,7 @@ TEST(XgboostModel, FeatureIdsComeFromNamesOrTheCommandLine) {
   XgbModel unnamed = readXgboostModel(model(kTree0, "[]"), "m.json");
   EXPECT_THAT(errorOf(model(kTree0, "[]")), HasSubstr("no feature names"));
   EXPECT_THAT(errorOf(model(kTree0, "[]")), HasSubstr("--feature-ids"));
-  auto forest = toForest(unnamed, featureIdsOf(unnamed, {11, -2, 40}, "m.json"));
+  auto forest = toForest(unnamed, featureIdsOf(unnamed, {11, -2, 40}, "m.json", "--feature-ids"));
   EXPECT_EQ(forest->inputKeys, (std::vector<std::string>{"11", "-2", "40"}));
   EXPECT_EQ(forest->featureMapping[1], static_cast<uint32_t>(-2));
   EXPECT_THAT(errorOf(model(kTree0, R"(["a","b","c"])")), HasSubstr("feature name \"a\" is not an integer"));

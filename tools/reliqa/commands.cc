@@ -191,7 +191,7 @@ void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
   if (o.input.size() > 4 && o.input.compare(o.input.size() - 4, 4, ".ubj") == 0) {
     throw ToolError(name, 0, "binary (UBJSON) models cannot be read; save the model as JSON: save_model(\"model.json\")");
   }
-  const ConvertedModel converted = convertXgboostJson(readFile(o.input), name, given);
+  const ConvertedModel converted = convertXgboostJson(readFile(o.input), name, given, "--feature-ids 1,2,...");
   if (o.output == "-") {
     out.write(converted.text);
   } else {

@@ -1,0 +1,149 @@
+#!/usr/bin/python3
+"""Scoring from Python: reliqa's Model.predict beside XGBoost's inplace_predict.
+
+    PYTHONPATH=build/python /usr/bin/python3 bench/python_bench.py [--models DIR] [--rows N]
+
+Scores N (default 100,000) rows of 74 float32 features with the XGBoost models
+m500_d6 and m2000_d8 and their conversions (DIR, default
+build/xgboost-bench-models: build the target xgboost_bench_models first), at
+one thread and at two, with XGBoost 1.7's inplace_predict on the same rows
+with the same thread count. reliqa runs with the walk this CPU picks, and
+forced to the scalar walk (what machines without AVX-512, phones among them,
+pick) and to the portable one. Before timing, the scores of both are compared.
+
+Then: one row from Python (predict on a 1-row array) against the C++ score of
+one row (build/bin/xgboost_bench, when built), and the peak resident memory of
+scoring a million rows. Prints one table per run, headed by the CPU flags.
+Timings are the best of --repeat runs, wall time.
+"""
+
+import argparse
+import json
+import os
+import resource
+import subprocess
+import sys
+import time
+
+import numpy as np
+import xgboost as xgb
+
+import reliqa
+
+MODELS = ("m500_d6", "m2000_d8")
+FLAGS = ("fma", "sse4_2", "avx2", "bmi2", "avx512f")
+
+
+def cpu_flags():
+    with open("/proc/cpuinfo") as f:
+        for line in f:
+            if line.startswith("flags"):
+                have = set(line.split(":", 1)[1].split())
+                return " ".join(f for f in FLAGS if f in have) or "(none of " + " ".join(FLAGS) + ")"
+    return "unknown"
+
+
+def cpu_model():
+    with open("/proc/cpuinfo") as f:
+        for line in f:
+            if line.startswith("model name"):
+                return line.split(":", 1)[1].strip()
+    return "unknown"
+
+
+def best_time(fn, repeat):
+    best = float("inf")
+    for _ in range(repeat):
+        start = time.perf_counter()
+        fn()
+        best = min(best, time.perf_counter() - start)
+    return best
+
+
+def one_row_cpp(xgboost_bench):
+    """µs of the C++ score of one row, per model, from xgboost_bench."""
+    if not xgboost_bench or not os.access(xgboost_bench, os.X_OK):
+        return {}
+    out = subprocess.run([xgboost_bench, "--benchmark_filter=BM_Reliqa/(m500_d6|m2000_d8)$",
+                          "--benchmark_format=json", "--benchmark_min_time=0.3"],
+                         capture_output=True, text=True, check=True).stdout
+    report = json.loads(out[out.index("{"):])
+    return {b["name"].split("/")[1]: b["real_time"] / 1000.0 for b in report["benchmarks"]
+            if b.get("run_type", "iteration") == "iteration"}
+
+
+PEAK_RSS_CHILD = """
+import resource, sys, numpy as np, reliqa
+model = reliqa.Model.load(sys.argv[1])
+X = np.random.default_rng(3).normal(size=(1_000_000, 74)).astype(np.float32)
+before = resource.getrusage(resource.RUSAGE_SELF).ru_maxrss
+model.predict(X, nthread=2)
+after = resource.getrusage(resource.RUSAGE_SELF).ru_maxrss
+print(before, after)
+"""
+
+
+def main():
+    parser = argparse.ArgumentParser(description=__doc__, formatter_class=argparse.RawDescriptionHelpFormatter)
+    parser.add_argument("--models", default="build/xgboost-bench-models")
+    parser.add_argument("--rows", type=int, default=100_000)
+    parser.add_argument("--repeat", type=int, default=3)
+    parser.add_argument("--xgboost-bench", default="build/bin/xgboost_bench")
+    args = parser.parse_args()
+
+    rng = np.random.default_rng(11)
+    X = rng.normal(size=(args.rows, 74)).astype(np.float32)
+    walks = {"best": "", "scalar": "scalar", "portable": "portable"}
+    print(f"CPU: {cpu_model()}, {os.cpu_count()} cores; flags: {cpu_flags()}")
+    print(f"{args.rows} rows of 74 float32 features; XGBoost {xgb.__version__}; best of {args.repeat}\n")
+    print("| model | threads | XGBoost µs/row | reliqa µs/row | x XGBoost | scalar µs/row | x XGBoost "
+          "| portable µs/row | x XGBoost |")
+    print("|---|---:|---:|---:|---:|---:|---:|---:|---:|")
+    per_row = {}
+    for name in MODELS:
+        booster = xgb.Booster(model_file=os.path.join(args.models, name + ".json"))
+        text = open(os.path.join(args.models, name + ".txt"), "rb").read()
+        ours = {walk: reliqa.Model(text, _walk=flag) for walk, flag in walks.items()}
+        theirs = booster.inplace_predict(X)
+        mine = ours["best"].predict(X)
+        diff = float(np.max(np.abs(theirs.astype(np.float64) - mine)))
+        if diff > 1e-6 or not np.array_equal(theirs > 0.5, mine > 0.5):
+            sys.exit(f"{name}: scores differ from XGBoost's by up to {diff}")
+        for walk in ours:
+            if not np.array_equal(ours[walk].predict(X), mine):
+                sys.exit(f"{name}: the {walk} walk gives other bits")
+        for threads in (1, 2):
+            booster.set_param({"nthread": threads})
+            t_xgb = best_time(lambda: booster.inplace_predict(X), max(1, args.repeat - 1)) / args.rows * 1e6
+            row = [name, str(threads), f"{t_xgb:.3f}"]
+            for walk, model in ours.items():
+                t = best_time(lambda: model.predict(X, nthread=threads), args.repeat) / args.rows * 1e6
+                per_row[(name, threads, walk)] = t
+                row += [f"{t:.3f}", f"{t_xgb / t:.1f}"]
+            print("| " + " | ".join(row) + " |")
+
+    print("\n| model | walk | 2 threads over 1 |")
+    print("|---|---|---:|")
+    for name in MODELS:
+        for walk in walks:
+            print(f"| {name} | {walk} | {per_row[(name, 1, walk)] / per_row[(name, 2, walk)]:.2f}x |")
+
+    cpp = one_row_cpp(args.xgboost_bench)
+    print("\n| model | one row from Python µs | C++ score of one row µs | ratio |")
+    print("|---|---:|---:|---:|")
+    for name in MODELS:
+        model = reliqa.Model.load(os.path.join(args.models, name + ".txt"))
+        rows = [X[i:i + 1] for i in range(2000)]
+        t = best_time(lambda: [model.predict(r) for r in rows], args.repeat) / len(rows) * 1e6
+        c = cpp.get(name)
+        print(f"| {name} | {t:.2f} | {'%.2f' % c if c else 'n/a'} | {'%.2f' % (t / c) if c else 'n/a'} |")
+
+    child = subprocess.run([sys.executable, "-c", PEAK_RSS_CHILD, os.path.join(args.models, "m500_d6.txt")],
+                           capture_output=True, text=True, check=True, env=os.environ)
+    before, after = (int(v) for v in child.stdout.split())
+    print(f"\nPeak RSS scoring 1,000,000 rows (m500_d6, 2 threads): {after / 1024:.0f} MiB, of which "
+          f"{(after - before) / 1024:.1f} MiB beyond the process with X (296 MB of float32) in memory")
+
+
+if __name__ == "__main__":
+    main()
