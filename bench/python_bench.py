@@ -23,6 +23,7 @@ import os
 import resource
 import subprocess
 import sys
+import tempfile
 import time
 
 import numpy as np
@@ -64,18 +65,25 @@ def one_row_cpp(xgboost_bench):
     """µs of the C++ score of one row, per model, from xgboost_bench."""
     if not xgboost_bench or not os.access(xgboost_bench, os.X_OK):
         return {}
-    out = subprocess.run([xgboost_bench, "--benchmark_filter=BM_Reliqa/(m500_d6|m2000_d8)$",
-                          "--benchmark_format=json", "--benchmark_min_time=0.3"],
-                         capture_output=True, text=True, check=True).stdout
-    report = json.loads(out[out.index("{"):])
-    return {b["name"].split("/")[1]: b["real_time"] / 1000.0 for b in report["benchmarks"]
+    with tempfile.TemporaryDirectory() as tmp:
+        report_path = os.path.join(tmp, "report.json")
+        subprocess.run([xgboost_bench, "--benchmark_filter=BM_Reliqa/(m500_d6|m2000_d8)$",
+                        f"--benchmark_out={report_path}", "--benchmark_out_format=json",
+                        "--benchmark_min_time=0.3"], capture_output=True, check=True)
+        with open(report_path) as f:
+            report = json.load(f)
+    scale = {"ns": 1e-3, "us": 1.0, "ms": 1e3}
+    return {b["name"].split("/")[1]: b["real_time"] * scale[b["time_unit"]] for b in report["benchmarks"]
             if b.get("run_type", "iteration") == "iteration"}
 
 
 PEAK_RSS_CHILD = """
 import resource, sys, numpy as np, reliqa
 model = reliqa.Model.load(sys.argv[1])
-X = np.random.default_rng(3).normal(size=(1_000_000, 74)).astype(np.float32)
+rng = np.random.default_rng(3)
+X = np.empty((1_000_000, 74), dtype=np.float32)
+for i in range(0, len(X), 50_000):  # in chunks: no temporary as large as X
+    X[i:i + 50_000] = rng.standard_normal(size=(50_000, 74), dtype=np.float32)
 before = resource.getrusage(resource.RUSAGE_SELF).ru_maxrss
 model.predict(X, nthread=2)
 after = resource.getrusage(resource.RUSAGE_SELF).ru_maxrss

@@ -169,8 +169,10 @@ class Model:
         if missing is not None:
             missing = float(missing)
         nthread = int(nthread)
-        if nthread < 0:
-            raise ValueError(f"nthread must be 0 (every core) or more, got {nthread}")
+        if not 0 <= nthread <= 4096:
+            raise ValueError(f"nthread must be 0 (every core) to 4096, got {nthread}")
+        if feature_ids is None and type(X) is np.ndarray:
+            return self._native.predict(X, None, missing, bool(output_margin), nthread)
         column_ids = None
         if _is_dataframe(X):
             column_ids = _feature_ids(X.columns, what="column")

@@ -54,7 +54,7 @@ void scoreRange(const thornvale::BoostingModel& model, const Matrix& x, const st
     model.rawScores(nullptr, end - first, 0, out + first);
   } else {
     const size_t length = columns.size();
-    std::vector<float> block(kBlockRows * length);
+    std::vector<float> block(std::min(kBlockRows, end - first) * length);
     for (size_t at = first; at < end; at += kBlockRows) {
       const size_t n = std::min(kBlockRows, end - at);
       if (x.isDouble) {
@@ -94,7 +94,9 @@ std::vector<int64_t> columnsForModel(const thornvale::BoostingModel& model, cons
 
 void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
                 std::optional<double> missing, bool probability, unsigned threads, double* out) {
-  if (threads == 0) threads = std::max(1u, std::thread::hardware_concurrency());
+  // Asking costs a read of /sys each time; the answer does not change.
+  static const unsigned cores = std::max(1u, std::thread::hardware_concurrency());
+  if (threads == 0) threads = cores;
   // At least a few blocks per thread, or threads cost more than they give.
   const size_t useful = std::max<size_t>(1, x.rows / (4 * kBlockRows));
   const size_t count = std::min<size_t>(threads, useful);

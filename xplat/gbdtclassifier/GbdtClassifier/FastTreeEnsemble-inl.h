@@ -100,11 +100,7 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
 
   double unnormalizedScore(const std::vector<float>& features) const override {
     checkLength(features);
-    const float* x = features.data();
-    const auto [first, end] = selectModel(x);
-    if (kernel_ == WalkKernel::kScalar && !complete_.empty()) return sumComplete(x, first, end);
-    if (kernel_ == WalkKernel::kAvx512 && !walk_.empty()) return sumGathered(x, first, end);
-    return sumInterleaved(x, first, end);
+    return scoreRow(features.data());
   }
   double score(const std::vector<float>& features) const override {
     return logistic(unnormalizedScore(features));
@@ -426,6 +422,18 @@ class FastTreeEnsembleOOP final : public FastTreeEnsemble<float> {
   // [first, end), into sums[0, n). `keys` has room for the block's keys, or
   // for its rows copied by feature; it is empty for vectors wider than
   // kMaxBlockCopy, which no kernel lays out.
+  // One row with the kernel in use.
+  double scoreRow(const float* x) const {
+    const auto [first, end] = selectModel(x);
+    if (kernel_ == WalkKernel::kScalar && !complete_.empty()) return sumComplete(x, first, end);
+    if (kernel_ == WalkKernel::kAvx512 && !walk_.empty()) return sumGathered(x, first, end);
+    return sumInterleaved(x, first, end);
+  }
+
+  // Below this many rows a block costs more than its rows one at a time: the
+  // vector block walk always fills all of its kBlockRows lanes.
+  size_t fewestBlockRows() const { return kernel_ == WalkKernel::kAvx512 ? kBlockRows / 2 : 4; }
+
   void scoreBlock(const float* const* rows, size_t n, size_t first, size_t end, uint32_t* keys,
                   double* sums) const {
     std::fill(sums, sums + n, baseScore_);
@@ -614,6 +622,10 @@ void FastTreeEnsembleOOP<FeatureIdT, NodeIndexT>::unnormalizedScores(const float
     throw std::invalid_argument("rows are " + std::to_string(rowStride) +
                                 " entries apart but the compiled forest reads position " +
                                 std::to_string(requiredFeatures_ - 1));
+  }
+  if (numRows < fewestBlockRows()) {
+    for (size_t r = 0; r < numRows; ++r) out[r] = scoreRow(rows + r * rowStride);
+    return;
   }
   const size_t slots = requiredFeatures_ + 1;
   std::vector<uint32_t> keys(
