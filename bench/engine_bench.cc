@@ -39,6 +39,7 @@
 #include <vector>
 
 #include "bench/cpu_flags.h"
+#include "tools/common/quiet_stdout.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
@@ -61,15 +62,7 @@ constexpr Shape kShapes[] = {{"100x6", 100, 6, 0.0},   {"500x6", 500, 6, 0.0},
                              {"2000x8r", 2000, 8, 0.2}};
 
 // Keeps the standard-output line of the model reader out of the report.
-class QuietStdout {
- public:
-  QuietStdout() : saved_(std::cout.rdbuf(sink_.rdbuf())) {}
-  ~QuietStdout() { std::cout.rdbuf(saved_); }
-
- private:
-  std::ostringstream sink_;
-  std::streambuf* saved_;
-};
+using reliqa::tool::QuietStdout;
 
 struct Fixture {
   std::string text;

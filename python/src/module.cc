@@ -29,6 +29,7 @@
 #include "tools/common/collection_reader.h"
 #include "tools/common/errors.h"
 #include "tools/common/feature_rows.h"
+#include "tools/common/quiet_stdout.h"
 #include "tools/common/xgboost_model.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
@@ -45,18 +46,9 @@ using thornvale::FeatureMap;
 // Number of computed features: ids 1 to kFeatureCount.
 constexpr int32_t kFeatureCount = 74;
 
-// Sends what the model reader prints on standard output ("Deseralization
-// version: ...") nowhere while a model is read; the interpreter's lock keeps
-// other Python threads out meanwhile.
-class QuietStdout {
- public:
-  QuietStdout() : saved_(std::cout.rdbuf(sink_.rdbuf())) {}
-  ~QuietStdout() { std::cout.rdbuf(saved_); }
-
- private:
-  std::ostringstream sink_;
-  std::streambuf* saved_;
-};
+// Model reading prints on standard output; the interpreter's lock keeps
+// other Python threads out while it is quieted.
+using tool::QuietStdout;
 
 // The walk named `walk` ("" for the best one this CPU runs).
 thornvale::WalkKernel walkNamed(const std::string& walk) {

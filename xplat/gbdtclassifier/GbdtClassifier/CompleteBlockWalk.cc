@@ -4,16 +4,7 @@
 
 #include <algorithm>
 
-#if defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
-#define RELIQA_BLOCK_X86 1
-#if defined(__GNUC__) && !defined(__clang__)
-// Some GCC versions warn inside their own AVX-512 intrinsics, whose unused
-// pass-through operands are deliberately undefined.
-#pragma GCC diagnostic ignored "-Wuninitialized"
-#pragma GCC diagnostic ignored "-Wmaybe-uninitialized"
-#endif
-#include <immintrin.h>
-#endif
+#include "xplat/gbdtclassifier/GbdtClassifier/X86Intrinsics.h"
 
 namespace thornvale {
 
@@ -34,7 +25,7 @@ void completeBlockKeys(const float* const* rows, size_t numRows, size_t slots, u
   }
 }
 
-#ifdef RELIQA_BLOCK_X86
+#ifdef RELIQA_X86_INTRINSICS
 namespace {
 
 constexpr int kVectors = static_cast<int>(kBlockRows / 16);

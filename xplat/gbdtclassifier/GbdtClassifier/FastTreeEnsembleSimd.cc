@@ -2,20 +2,11 @@
 
 #include <glog/logging.h>
 
-#if defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
-#define RELIQA_WALK_X86 1
-#if defined(__GNUC__) && !defined(__clang__)
-// Some GCC versions warn inside their own AVX-512 intrinsics, whose unused
-// pass-through operands are deliberately undefined.
-#pragma GCC diagnostic ignored "-Wuninitialized"
-#pragma GCC diagnostic ignored "-Wmaybe-uninitialized"
-#endif
-#include <immintrin.h>
-#endif
+#include "xplat/gbdtclassifier/GbdtClassifier/X86Intrinsics.h"
 
 namespace thornvale {
 
-#ifdef RELIQA_WALK_X86
+#ifdef RELIQA_X86_INTRINSICS
 namespace {
 
 // Many independent vectors per group keep enough loads in flight to hide
@@ -107,7 +98,7 @@ bool walkKernelSupported(WalkKernel kernel) {
     case WalkKernel::kPortable:
     case WalkKernel::kScalar:
       return true;
-#ifdef RELIQA_WALK_X86
+#ifdef RELIQA_X86_INTRINSICS
     case WalkKernel::kAvx512:
       return __builtin_cpu_supports("avx512f");
 #endif
@@ -124,7 +115,7 @@ void walkGroup(WalkKernel kernel, const WalkNode* nodes, const uint32_t* roots,
                const WalkNode* rootNodes, uint32_t rounds, const float* features, size_t slots,
                float* leaves) {
   switch (kernel) {
-#ifdef RELIQA_WALK_X86
+#ifdef RELIQA_X86_INTRINSICS
     case WalkKernel::kAvx512:
       // Few features are picked from registers rather than gathered.
       switch ((slots + 31) / 32) {
