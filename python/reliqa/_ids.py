@@ -16,11 +16,11 @@ def feature_id(value: Any, *, where: str) -> int:
     if isinstance(value, (int, np.integer)):
         number = int(value)
     elif isinstance(value, str):
-        text = value.strip()
-        body = text[1:] if text[:1] in "+-" else text
+        # As the native reader of rows takes them: an optional minus, digits.
+        body = value[1:] if value.startswith("-") else value
         if not body.isdigit() or not body.isascii():
             raise ValueError(f"{where}: feature id {value!r} is not a decimal integer")
-        number = int(text)
+        number = int(value)
     else:
         raise ValueError(f"{where}: a feature id is an int or a decimal string, not {type(value).__name__}")
     if not _INT32.min <= number <= _INT32.max:
