@@ -73,8 +73,11 @@ def main():
     impl, abi, platform = tags()
     dist_info = f"{NAME}-{version}.dist-info"
     files = {}
+    # The Python files of the sources: a file the build once copied and the
+    # sources have since lost must not ship.
+    sources = os.path.join(os.path.dirname(os.path.abspath(__file__)), "..", "python", NAME)
     for name in sorted(os.listdir(package_dir)):
-        if name.endswith(".py"):
+        if name.endswith(".py") and os.path.exists(os.path.join(sources, name)):
             with open(os.path.join(package_dir, name), "rb") as f:
                 files[f"{NAME}/{name}"] = f.read()
         elif name == "_native" + suffix:

@@ -22,7 +22,10 @@ class Classifier:
         tool uses with ``--store``. Its entries are the classifier's own, so
         the tool and this class see each other's parameters.
 
-    A refused call raises ValueError and leaves the store as it was.
+    A call refused for its input (a model text that does not load, a
+    threshold or feature value the store cannot hold) raises ValueError
+    before anything is written. Failures of the store itself are logged and
+    absorbed, as on the phone. One classifier may be shared by threads.
     """
 
     def __init__(self, store: Union[str, "os.PathLike[str]"]) -> None:
@@ -38,8 +41,10 @@ class Classifier:
         """
         if isinstance(text, str):
             text = text.encode("utf-8")
+        if not isinstance(model_id, str):
+            raise ValueError(f"model_id is a str, not {type(model_id).__name__}")
         threshold = float(threshold)
-        for message in self._native.set_model(bytes(text), str(model_id), threshold):
+        for message in self._native.set_model(bytes(text), model_id, threshold):
             warnings.warn(message, stacklevel=2)
 
     def set_server_features(self, features: Mapping[Union[int, str], Union[int, float, str]]) -> None:

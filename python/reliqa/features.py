@@ -54,6 +54,8 @@ def features(collections: Collections):
 
 
 def _collection_texts(collections: Collections):
+    if isinstance(collections, str) and collections.lstrip().startswith("["):
+        raise ValueError("a JSON array is not a collection; give a list of collections instead")
     if isinstance(collections, os.PathLike) or (
         isinstance(collections, str) and not collections.lstrip().startswith("{")
     ):

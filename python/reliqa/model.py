@@ -5,6 +5,7 @@ from __future__ import annotations
 import json
 import math
 import os
+import tempfile
 from typing import Any, Iterable, Mapping, Optional, Sequence, Union
 
 import numpy as np
@@ -94,12 +95,13 @@ class Model:
         """Writes the model text to `path` (through a temporary file, so that a
         failure leaves no partial file)."""
         path = os.fspath(path)
-        tmp = f"{path}.tmp-{os.getpid()}"
+        fd, tmp = tempfile.mkstemp(prefix=os.path.basename(path) + ".", dir=os.path.dirname(path) or ".")
         try:
-            with open(tmp, "wb") as f:
+            with os.fdopen(fd, "wb") as f:
                 f.write(self._native.text)
                 f.flush()
                 os.fsync(f.fileno())
+            os.chmod(tmp, 0o644)
             os.replace(tmp, path)
         except BaseException:
             if os.path.exists(tmp):
@@ -142,24 +144,26 @@ class Model:
         Parameters
         ----------
         X:
-            A 2-D float32 or float64 numpy array (C or Fortran order; it is
-            not copied), or a pandas DataFrame whose column names are feature
-            ids (ints or decimal strings), in any order.
+            A 2-D float32 or float64 numpy array, in any memory order (it is
+            not copied; other number types are copied once as float64), or a
+            pandas DataFrame whose column names are feature ids (ints or
+            decimal strings), in any order.
         feature_ids:
             The feature id of each column of an array. Default: the model's
             :attr:`feature_ids`. Columns the model does not use are ignored;
             features the model uses that no column gives read 0.0.
         missing:
             A cell equal to this value is an absent feature and reads 0.0, as
-            an id absent from the phone's map does (NaN matches NaN). With
+            an id absent from the phone's map does (NaN matches NaN; float32
+            cells are compared with the float32 nearest to it). With
             ``None`` every cell is a value, and NaN takes the trees' NaN
             branches. (The phone classifies no collection whose features hold
             NaN or an infinity.)
         output_margin:
             Return raw scores instead of probabilities.
         nthread:
-            Threads to score with; 0 means one per core. Every count gives the
-            same bits.
+            Threads to score with; 0 or -1 means one per core. Every count
+            gives the same bits.
 
         Returns
         -------
@@ -169,9 +173,11 @@ class Model:
         if missing is not None:
             missing = float(missing)
         nthread = int(nthread)
+        if nthread == -1:
+            nthread = 0
         if not 0 <= nthread <= 4096:
-            raise ValueError(f"nthread must be 0 (every core) to 4096, got {nthread}")
-        if feature_ids is None and type(X) is np.ndarray:
+            raise ValueError(f"nthread must be -1 or 0 (every core) up to 4096, got {nthread}")
+        if feature_ids is None and type(X) is np.ndarray and X.dtype in _FLOATS:
             return self._native.predict(X, None, missing, bool(output_margin), nthread)
         column_ids = None
         if _is_dataframe(X):
@@ -183,6 +189,10 @@ class Model:
             column_ids = _feature_ids(feature_ids, what="feature_ids item")
         if not isinstance(X, np.ndarray):
             raise TypeError(f"X must be a numpy array or a pandas DataFrame, not {type(X).__name__}")
+        if X.dtype not in _FLOATS:
+            if not (np.issubdtype(X.dtype, np.number) or X.dtype == np.bool_) or np.iscomplexobj(X):
+                raise ValueError(f"X must hold real numbers, got {X.dtype}")
+            X = X.astype(np.float64)  # other number types: one copy, as doubles
         return self._native.predict(X, column_ids, missing, bool(output_margin), nthread)
 
     def predict_rows(
@@ -206,6 +216,11 @@ class Model:
             missing = float(missing)
         return self._native.predict_rows(rows, missing, bool(output_margin))
 
+    def __reduce__(self):
+        # Pickled as its text: a model crosses to other processes (joblib,
+        # multiprocessing) and loads there as here.
+        return (Model, (self.text,))
+
     def __repr__(self) -> str:
         return f"<reliqa.Model: {self.num_trees} trees over {len(self.feature_ids)} features>"
 
@@ -216,11 +231,18 @@ def _is_dataframe(x: Any) -> bool:
 
 def _frame_values(frame: Any) -> np.ndarray:
     """The cells of a DataFrame as one float array, without a copy where the
-    frame holds one block of float32 or float64."""
+    frame holds one block of float32 or float64. Nullable columns give NaN
+    for their missing cells."""
+    import pandas as pd
+
     dtypes = set(frame.dtypes)
-    if len(dtypes) == 1 and next(iter(dtypes)) in (np.dtype(np.float32), np.dtype(np.float64)):
+    if len(dtypes) == 1 and next(iter(dtypes)) in _FLOATS:
         return frame.to_numpy(copy=False)
     for name, dtype in frame.dtypes.items():
-        if not (np.issubdtype(dtype, np.number) or np.issubdtype(dtype, np.bool_)):
-            raise ValueError(f"column {name!r} holds {dtype}, not numbers")
-    return frame.to_numpy(dtype=np.float64)
+        numeric = pd.api.types.is_numeric_dtype(dtype) or pd.api.types.is_bool_dtype(dtype)
+        if not numeric or isinstance(dtype, pd.CategoricalDtype) or pd.api.types.is_complex_dtype(dtype):
+            raise ValueError(f"column {name!r} holds {dtype}, not real numbers")
+    return frame.to_numpy(dtype=np.float64, na_value=np.nan)
+
+
+_FLOATS = (np.dtype(np.float32), np.dtype(np.float64))

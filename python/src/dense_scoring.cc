@@ -6,6 +6,7 @@
 #include <exception>
 #include <stdexcept>
 #include <string>
+#include <system_error>
 #include <thread>
 #include <unordered_map>
 
@@ -32,7 +33,6 @@ template <typename Cell>
 void fillBlock(const Matrix& x, const std::vector<int64_t>& columns, std::optional<double> missing, size_t first,
                size_t n, float* block) {
   const size_t length = columns.size();
-  const bool missingIsNaN = missing && std::isnan(*missing);
   for (size_t r = 0; r < n; ++r) {
     float* vector = block + r * length;
     for (size_t p = 0; p < length; ++p) {
@@ -41,9 +41,8 @@ void fillBlock(const Matrix& x, const std::vector<int64_t>& columns, std::option
         vector[p] = 0.0f;
         continue;
       }
-      const double v = static_cast<double>(cellAt<Cell>(x, first + r, static_cast<size_t>(c)));
-      const bool absent = missing && (missingIsNaN ? std::isnan(v) : v == *missing);
-      vector[p] = absent ? 0.0f : static_cast<float>(v);
+      const Cell v = cellAt<Cell>(x, first + r, static_cast<size_t>(c));
+      vector[p] = isMissing(v, missing) ? 0.0f : static_cast<float>(v);
     }
   }
 }
@@ -105,19 +104,23 @@ void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const st
     return;
   }
   std::vector<std::exception_ptr> failures(count);
+  const auto work = [&](size_t t) {
+    try {
+      scoreRange(model, x, columns, missing, probability, x.rows * t / count, x.rows * (t + 1) / count, out);
+    } catch (...) {
+      failures[t] = std::current_exception();
+    }
+  };
   std::vector<std::thread> workers;
   workers.reserve(count);
-  for (size_t t = 0; t < count; ++t) {
-    const size_t first = x.rows * t / count;
-    const size_t end = x.rows * (t + 1) / count;
-    workers.emplace_back([&, t, first, end] {
-      try {
-        scoreRange(model, x, columns, missing, probability, first, end, out);
-      } catch (...) {
-        failures[t] = std::current_exception();
-      }
-    });
+  size_t started = 1;  // range 0 is this thread's
+  try {
+    for (; started < count; ++started) workers.emplace_back(work, started);
+  } catch (const std::system_error&) {
+    // No more threads to be had: this one scores the ranges left over.
   }
+  work(0);
+  for (size_t t = started; t < count; ++t) work(t);
   for (auto& w : workers) w.join();
   for (const auto& f : failures) {
     if (f) std::rethrow_exception(f);

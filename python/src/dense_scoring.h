@@ -5,9 +5,13 @@
 // double cells, any strides (C or Fortran order, or a slice). `columns[p]` is
 // the column that feeds position p of the model's feature vector, or -1 when
 // no column does (the position reads 0.0, as an id absent from a map does).
-// A cell equal to `missing` (NaN matching NaN) is absent and reads 0.0; with
-// no `missing`, every cell is a value and NaN takes the forest's NaN
-// branches. Present cells are converted to float as the map's doubles are.
+// A cell equal to `missing` (NaN matching NaN; compared in the cell's own
+// type, so float cells match the float nearest to `missing`) is absent and
+// reads 0.0; with no `missing`, every cell is a value and NaN takes the
+// forest's NaN branches. Present cells are converted to float as the map's
+// doubles are.
+//
+// isMissing() is that rule for one cell.
 //
 // scoreDense() fills `out[r]` with the raw score (or, with `probability`, its
 // logistic) of row r, splitting the rows across `threads` threads (0: one per
@@ -15,9 +19,11 @@
 // one block of float vectors; nothing else is copied. Reads the matrix and
 // writes `out` only; the caller keeps both alive and unchanged during the
 // call, which may run without the Python interpreter's lock. Throws what
-// the model throws; a thread's failure is rethrown in the caller.
+// the model throws; a thread's failure is rethrown in the caller, and a
+// thread that cannot be started leaves its rows to the caller's thread.
 #pragma once
 
+#include <cmath>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -41,6 +47,12 @@ struct Matrix {
 // whose id appears again later in featureMapping reads nothing (the model
 // reads that id at its last position). Ids are the maps' signed 32-bit ids.
 std::vector<int64_t> columnsForModel(const thornvale::BoostingModel& model, const std::vector<int32_t>& columnIds);
+
+template <typename Cell>
+bool isMissing(Cell v, std::optional<double> missing) {
+  if (!missing) return false;
+  return std::isnan(*missing) ? std::isnan(v) : v == static_cast<Cell>(*missing);
+}
 
 void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
                 std::optional<double> missing, bool probability, unsigned threads, double* out);

@@ -73,11 +73,7 @@ std::unique_ptr<thornvale::BoostingModel> readModel(const std::string& text, con
                                                     const std::string& walk) {
   const thornvale::WalkKernel kernel = walkNamed(walk);
   QuietStdout quiet;
-  try {
-    return std::make_unique<thornvale::BoostingModel>(text, kernel);
-  } catch (const std::exception& e) {
-    throw tool::ToolError(name, 0, std::string("the model cannot be loaded: ") + e.what());
-  }
+  return tool::loadModel(name, text, kernel);
 }
 
 // A Python int or decimal string as a signed 32-bit feature id.
@@ -115,9 +111,6 @@ double featureValue(const py::handle& value, const std::string& where) {
   return v;
 }
 
-bool isAbsent(double v, std::optional<double> missing) {
-  return missing && (std::isnan(*missing) ? std::isnan(v) : v == *missing);
-}
 
 class Model {
  public:
@@ -193,20 +186,20 @@ class Model {
   }
 
   py::array_t<double> predictRows(const py::iterable& rows, std::optional<double> missing, bool outputMargin) const {
-    std::vector<double> scores;
+    std::vector<FeatureMap> maps;
     size_t index = 0;
     for (const py::handle row : rows) {
       const std::string where = "row " + std::to_string(index);
       FeatureMap map;
       if (py::isinstance<py::str>(row) || py::isinstance<py::bytes>(row)) {
         for (const auto& [id, value] : tool::parseFeatureRow(row.cast<std::string>(), where)) {
-          if (!isAbsent(value, missing)) map.emplace(id, value);
+          if (!isMissing(value, missing)) map.emplace(id, value);
         }
       } else if (py::isinstance<py::dict>(row)) {
         for (const auto& [key, value] : row.cast<py::dict>()) {
           const int32_t id = featureId(key, where);
           const double v = featureValue(value, where + ", feature " + std::to_string(id));
-          if (isAbsent(v, missing)) continue;
+          if (isMissing(v, missing)) continue;
           if (!map.emplace(id, v).second) {
             throw std::invalid_argument(where + ": feature id " + std::to_string(id) + " is given twice");
           }
@@ -215,9 +208,16 @@ class Model {
         throw std::invalid_argument(where + ": a row is a dict or a JSON text, not " +
                                     py::str(row.get_type().attr("__name__")).cast<std::string>());
       }
-      const double raw = model_->rawScore(map);
-      scores.push_back(outputMargin ? raw : thornvale::logistic(raw));
+      maps.push_back(std::move(map));
       ++index;
+    }
+    std::vector<double> scores(maps.size());
+    {
+      py::gil_scoped_release release;
+      for (size_t i = 0; i < maps.size(); ++i) {
+        const double raw = model_->rawScore(maps[i]);
+        scores[i] = outputMargin ? raw : thornvale::logistic(raw);
+      }
     }
     return py::array_t<double>(static_cast<py::ssize_t>(scores.size()), scores.data());
   }
@@ -260,9 +260,13 @@ py::array_t<double> extractFeatures(const std::vector<std::string>& texts, const
   return out;
 }
 
+// A classifier over the store at a path. Python threads may share one: each
+// call takes its own reference to the classifier in use (under the
+// interpreter's lock) before it lets go of the lock, so that set_model()
+// replacing it never pulls it from under a classification in progress.
 class Classifier {
  public:
-  explicit Classifier(std::string store) : store_(std::move(store)) { open(); }
+  explicit Classifier(std::string store) : store_(std::move(store)) { current(); }
 
   // Returns the warnings to raise in Python.
   std::vector<std::string> setModel(const std::string& text, const std::string& modelId, double threshold) {
@@ -273,39 +277,35 @@ class Classifier {
     std::vector<std::string> warnings;
     {
       QuietStdout quiet;
-      classifier_.reset();  // one writer of the store at a time
-      try {
-        tool::setModel(store_, params, "the model text", "give a replacement model text to set_model()",
-                       [&](const std::string& file, const std::string& what) {
-                         warnings.push_back(file.empty() ? what : file + ": " + what);
-                       });
-      } catch (...) {
-        reopenQuietly();
-        throw;
-      }
-      open();
+      tool::setModel(store_, params, "the model text", "give a replacement model text to set_model()",
+                     [&](const std::string& file, const std::string& what) {
+                       warnings.push_back(file.empty() ? what : file + ": " + what);
+                     });
     }
+    classifier_.reset();  // the next call reads the new parameters
+    current();
     return warnings;
   }
 
   void setServerFeatures(const std::string& json) {
     const FeatureMap features = tool::parseServerFeatures(json, "server features");
-    ensureOpen();
+    const auto classifier = current();
+    py::gil_scoped_release release;
     try {
-      classifier_->setServerFeatures(features);
+      classifier->setServerFeatures(features);
     } catch (const std::exception& e) {
       throw tool::ToolError(store_, 0, std::string("storing the server features failed: ") + e.what());
     }
   }
 
   py::dict classify(const std::string& json) {
-    ensureOpen();
     const rc::ReliqaClassifierInput collection = tool::parseCollection(json, "the collection");
+    const auto classifier = current();
     rc::ReliqaClassifierResult r;
     {
       py::gil_scoped_release release;
       try {
-        r = classifier_->classify(collection);
+        r = classifier->classify(collection);
       } catch (const std::exception& e) {
         throw tool::ToolError("the collection", 0, std::string("classification failed: ") + e.what());
       }
@@ -320,28 +320,24 @@ class Classifier {
   }
 
   std::string modelId() {
-    ensureOpen();
-    return classifier_->currentlyUsedModelId();
+    const auto classifier = current();
+    py::gil_scoped_release release;
+    return classifier->currentlyUsedModelId();
   }
 
  private:
-  void open() {
-    QuietStdout quiet;
-    classifier_ = tool::openClassifier(store_);
-  }
-  void ensureOpen() {
-    if (!classifier_) open();
-  }
-  void reopenQuietly() {
-    try {
-      open();
-    } catch (const std::exception&) {
-      classifier_.reset();  // opened again, with its message, on next use
+  // The classifier in use, opened when there is none (after a failure).
+  // Call with the interpreter's lock held.
+  std::shared_ptr<rc::ReliqasClassifier> current() {
+    if (!classifier_) {
+      QuietStdout quiet;
+      classifier_ = tool::openClassifier(store_);
     }
+    return classifier_;
   }
 
   std::string store_;
-  std::unique_ptr<rc::ReliqasClassifier> classifier_;
+  std::shared_ptr<rc::ReliqasClassifier> classifier_;
 };
 
 void quietLogging() {

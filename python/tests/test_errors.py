@@ -19,7 +19,8 @@ IDS = [1, 2, 3, 4, 5]
 
 
 @pytest.mark.parametrize("call, pattern", [
-    (lambda m: m.predict(np.zeros((4, 6), dtype=np.int64)), r"float32 or float64.*int64"),
+    (lambda m: m.predict(np.full((4, 6), "a")), r"X must hold real numbers, got <U1"),
+    (lambda m: m.predict(pd.DataFrame({1: [0.0], 2: pd.Categorical(["a"])})), r"column 2 holds category"),
     (lambda m: m.predict(np.zeros((4, 5))), r"X has 5 columns but the model reads 6 features"),
     (lambda m: m.predict(X6, feature_ids=[1, 2, 3]), r"X has 6 columns but feature_ids names 3"),
     (lambda m: m.predict(X6, feature_ids=IDS + ["01"]), r"items 0 and 5 both name feature id 1"),

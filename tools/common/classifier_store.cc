@@ -68,9 +68,10 @@ std::unique_ptr<rc::ReliqasClassifier> openClassifier(const std::string& path,
   }
 }
 
-std::unique_ptr<thornvale::BoostingModel> loadModel(const std::string& name, const std::string& text) {
+std::unique_ptr<thornvale::BoostingModel> loadModel(const std::string& name, const std::string& text,
+                                                    thornvale::WalkKernel kernel) {
   try {
-    return std::make_unique<thornvale::BoostingModel>(text);
+    return std::make_unique<thornvale::BoostingModel>(text, kernel);
   } catch (const std::exception& e) {
     throw ToolError(name, 0, std::string("the model cannot be loaded: ") + e.what());
   }

@@ -27,6 +27,7 @@
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMap.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/WalkKernel.h"
 
 namespace reliqa::tool {
 
@@ -40,8 +41,10 @@ std::unique_ptr<kestrova::reliqaclassifier::ReliqasClassifier> openClassifier(
     const std::string& path,
     std::shared_ptr<kestrova::mobile::xplat::keystash::PersistentKeyValueStore> store = nullptr);
 
-// Reads a model text; `name` names it in the message of the ToolError.
-std::unique_ptr<thornvale::BoostingModel> loadModel(const std::string& name, const std::string& text);
+// Reads a model text, laid out for `kernel`; `name` names it in the message
+// of the ToolError.
+std::unique_ptr<thornvale::BoostingModel> loadModel(const std::string& name, const std::string& text,
+                                                    thornvale::WalkKernel kernel = thornvale::bestWalkKernel());
 
 // Stores `params` (an empty mSerializedModel keeps the model and changes only
 // the identifier and the threshold). `modelName` names the text in messages;
