@@ -6,6 +6,7 @@ add_library(gbdt STATIC
   BoostingModel/serialize.cc
   BoostingModel/ModelWriter.cc
   BoostingModel/BoostingModel.cc
+  BoostingModel/TreeShap.cc
   FastTreeEnsembleSimd.cc
   CompleteTreeWalk.cc
   CompleteBlockWalk.cc)
@@ -18,6 +19,7 @@ foreach(test IN ITEMS
     BoostingModel/serialize_test
     BoostingModel/ModelWriter_test
     BoostingModel/BoostingModel_test
+    BoostingModel/TreeShap_test
     CompleteTreeWalk_test
     FastTreeEnsemble_test)
   get_filename_component(name ${test} NAME)
