@@ -316,6 +316,17 @@ TEST(Covers, RefusedShapesAndValuesNameTheTreeAndNode) {
   EXPECT_EQ(message({{1, 1, 1}, {1, 1, 1, 1, 1}}), "accepted");
 }
 
+TEST(Rows, ModelWithoutFeatureMappingHasOnlyItsConstantScore) {
+  Forest f = handForest();
+  f.featureMapping.clear();
+  const auto model = load(f);
+  const TreeShap shap(*model, {{1, 1, 1}, {1, 1, 1, 1, 1}});
+  EXPECT_EQ(shap.numContributions(), 0u);
+  double bias = 0.0;
+  shap.explainRows(nullptr, 1, 0, &bias);
+  EXPECT_EQ(bias, model->rawScore(FeatureMap{}));
+}
+
 TEST(Rows, ShortStrideIsRefused) {
   const auto model = load(handForest());
   const TreeShap shap(*model, {{1, 1, 1}, {1, 1, 1, 1, 1}});
