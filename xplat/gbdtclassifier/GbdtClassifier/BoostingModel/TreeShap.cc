@@ -302,7 +302,7 @@ void TreeShap::explainTree(const ShapTree& tree, const float* row, double* contr
     const Frame f = frames.back();
     frames.pop_back();
     const uint32_t l = f.pathLength;
-    const size_t start = size_t{f.pathStart} + l;
+    const size_t start = f.pathStart + l;
     if (paths.size() < start + l + 1) paths.resize(std::max(start + l + 1, 2 * paths.size()));
     PathEntry* m = paths.data() + start;
     std::copy(paths.data() + f.pathStart, paths.data() + f.pathStart + l, m);
@@ -373,12 +373,11 @@ void TreeShap::explainTree(const ShapTree& tree, const float* row, double* contr
       break;
     }
     // A child whose entry has no share either way adds nothing.
-    const auto startIndex = static_cast<uint32_t>(start);
     if (zero * coldShare != 0.0) {
-      frames.push_back({cold, length, startIndex, zero * coldShare, 0.0, node.position});
+      frames.push_back({cold, length, start, zero * coldShare, 0.0, node.position});
     }
     if (zero * hotShare != 0.0 || one != 0.0) {
-      frames.push_back({hot, length, startIndex, zero * hotShare, one, node.position});
+      frames.push_back({hot, length, start, zero * hotShare, one, node.position});
     }
   }
 }

@@ -87,7 +87,7 @@ class TreeShap {
     struct Frame {
       uint32_t node;
       uint32_t pathLength;  // unique positions on the path, before this node
-      uint32_t pathStart;   // offset of this frame's path copy in `paths`
+      size_t pathStart;     // offset of the parent's path in `paths`
       double zero;
       double one;
       int32_t position;
