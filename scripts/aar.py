@@ -50,7 +50,7 @@ def add(archive, name, data):
 
 
 def write(args):
-    jni = dict(spec.split("=", 1) for spec in args.jni)
+    jni = dict(item.split("=", 1) for item in args.jni)
     if sorted(jni) != sorted(ANDROID_ABIS):
         sys.exit(f"aar: --jni must name exactly {', '.join(ANDROID_ABIS)}; got {', '.join(sorted(jni))}")
     with open(args.classes, "rb") as f:
