@@ -42,6 +42,7 @@
 #include "tools/common/quiet_stdout.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/TreeShap.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/testing/RandomForests.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble-inl.h"
 
@@ -237,6 +238,33 @@ void registerFileModel(const std::string& path, std::vector<std::unique_ptr<File
   models.push_back(std::move(m));
 }
 
+// Contributions of the fixture's rows, with covers counted over 1000 rows
+// of the same distribution. Reports the explainer's tables beside the size
+// of the model text.
+void explain(benchmark::State& state, const Shape* shape) {
+  Fixture& f = fixture(*shape, true);
+  std::mt19937_64 rng(9);
+  std::uniform_real_distribution<float> u(-1.0f, 1.0f);
+  std::vector<float> background(1000 * kInputs);
+  for (float& x : background) x = u(rng);
+  const TreeShap shap(*f.model, backgroundCovers(*f.model, background.data(), 1000, kInputs));
+  const size_t rows = static_cast<size_t>(state.range(0));
+  std::vector<float> block(rows * kInputs);
+  for (size_t r = 0; r < rows; ++r) {
+    std::copy(f.vectors[r % kVectors].begin(), f.vectors[r % kVectors].end(), block.begin() + r * kInputs);
+  }
+  std::vector<double> out(rows * (kInputs + 1));
+  for (auto _ : state) {
+    shap.explainRows(block.data(), rows, kInputs, out.data());
+    benchmark::DoNotOptimize(out.data());
+  }
+  state.SetItemsProcessed(static_cast<int64_t>(state.iterations() * rows));
+  state.counters["us_per_row"] = benchmark::Counter(static_cast<double>(state.iterations() * rows) / 1e6,
+                                                    benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
+  state.counters["tables_MB"] = static_cast<double>(shap.tableBytes()) / 1e6;
+  state.counters["text_MB"] = static_cast<double>(f.text.size()) / 1e6;
+}
+
 void predict(benchmark::State& state, const Shape* shape, bool sixteenBit) {
   Fixture& f = fixture(*shape, sixteenBit);
   size_t i = 0;
@@ -287,6 +315,13 @@ int main(int argc, char** argv) {
   }
   for (const Shape& s : kShapes) {
     benchmark::RegisterBenchmark((std::string("Load/") + s.name).c_str(), load, &s)
+        ->Unit(benchmark::kMillisecond);
+  }
+  // One row alone, and rows side by side.
+  for (const Shape& s : kShapes) {
+    benchmark::RegisterBenchmark((std::string("Explain/") + s.name).c_str(), explain, &s)
+        ->Arg(1)
+        ->Arg(64)
         ->Unit(benchmark::kMillisecond);
   }
   benchmark::Initialize(&argc, argv);

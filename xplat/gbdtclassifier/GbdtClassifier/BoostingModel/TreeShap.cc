@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstring>
 #include <limits>
 #include <stdexcept>
 #include <string>
@@ -114,6 +115,65 @@ uint32_t modelNumber(float v) {
   return static_cast<uint32_t>(v);
 }
 
+
+// Trees whose paths test more distinct positions take the published walk.
+constexpr uint32_t kMaxPolynomialPositions = 32;
+
+// P_n(x) and P_{n-1}(x), Legendre polynomials by their three-term recurrence.
+std::pair<double, double> legendre(size_t n, double x) {
+  double previous = 1.0;
+  double current = x;
+  for (size_t k = 1; k < n; ++k) {
+    const double next = (static_cast<double>(2 * k + 1) * x * current - static_cast<double>(k) * previous) /
+                        static_cast<double>(k + 1);
+    previous = current;
+    current = next;
+  }
+  return {current, previous};
+}
+
+// The n nodes and weights of Gauss-Legendre quadrature on [-1, 1]: roots
+// bracketed on a grid and bisected to the last bit. Only + - * / of doubles,
+// so every platform gets the same bits.
+void gaussLegendre(size_t n, std::vector<double>& nodes, std::vector<double>& weights) {
+  nodes.clear();
+  weights.clear();
+  const size_t steps = 64 * n * n;
+  double a = -1.0;
+  double fa = legendre(n, a).first;
+  for (size_t s = 1; s <= steps && nodes.size() < n; ++s) {
+    double b = -1.0 + 2.0 * static_cast<double>(s) / static_cast<double>(steps);
+    double fb = legendre(n, b).first;
+    const double nextA = b;
+    const double nextFa = fb;
+    if ((fa < 0.0) != (fb < 0.0)) {
+      double lo = a, flo = fa, hi = b;
+      for (;;) {
+        const double mid = lo + (hi - lo) / 2.0;
+        if (mid <= lo || mid >= hi) break;
+        const double fm = legendre(n, mid).first;
+        if (fm == 0.0) {
+          lo = hi = mid;
+          break;
+        }
+        if ((fm < 0.0) == (flo < 0.0)) {
+          lo = mid;
+          flo = fm;
+        } else {
+          hi = mid;
+        }
+      }
+      const double x = std::abs(flo) <= std::abs(legendre(n, hi).first) ? lo : hi;
+      const auto [p, q] = legendre(n, x);
+      const double derivative = static_cast<double>(n) * (x * p - q) / (x * x - 1.0);
+      nodes.push_back(x);
+      weights.push_back(2.0 / ((1.0 - x * x) * derivative * derivative));
+    }
+    a = nextA;
+    fa = nextFa;
+  }
+}
+
 }  // namespace
 
 TreeCovers backgroundCovers(const BoostingModel& model, const float* rows, size_t numRows,
@@ -161,6 +221,15 @@ TreeShap::TreeShap(const BoostingModel& model, const TreeCovers& covers)
   modelIndexMap_ = forest.modelIndexMap;
   const std::vector<bool> equality = equalityPositions(forest);
   PreorderTree tree;
+  // The walk over a tree's path: its nodes, and for each the edge into it
+  // that last tested the parent's position before (restored on the way up).
+  struct OnPath {
+    uint32_t node;
+    uint32_t replaced;
+  };
+  std::vector<OnPath> path;
+  std::vector<uint32_t> parent;
+  std::vector<uint32_t> lastEdge(numPositions_, kNone);
   for (size_t t = 0; t < forest.trees.size(); ++t) {
     const WeightedTree& entry = forest.trees[t];
     layOut(entry.tree ? entry.tree->root.get() : nullptr, equality, tree);
@@ -181,46 +250,99 @@ TreeShap::TreeShap(const BoostingModel& model, const TreeCovers& covers)
     // absent node never reaches the lines below.
     if (entry.weight == 0.0 || constantScore_) continue;
 
-    ShapTree shapTree{static_cast<uint32_t>(nodes_.size()), tree.depth, tree.equalityWalk, 0.0};
-    for (size_t i = 0; i < tree.nodes.size(); ++i) {
+    const auto size = static_cast<uint32_t>(tree.nodes.size());
+    ShapTree shapTree{static_cast<uint32_t>(nodes_.size()), size, tree.depth, 0, tree.equalityWalk, 0.0};
+    parent.assign(size, kNone);
+    for (uint32_t i = 0; i < size; ++i) {
       const PreorderNode& n = tree.nodes[i];
-      ShapNode s{kLeaf, 0, 0.0f, false, 0.0, 0.0, 0.0};
+      ShapNode s{kLeaf, 0, 0.0f, false, 1.0, 1.0, {0.0}};
       if (n.node->isLeaf()) {
         s.value = static_cast<double>(static_cast<float>(
             static_cast<const ConstantNode*>(n.node)->value * entry.weight));
       } else {
         s.position = n.position;
-        s.right = shapTree.first + n.right;
+        s.right = n.right;
         s.threshold = n.threshold;
         s.equality = n.equality;
-        const double c = cover[i];
-        if (c == 0.0) {
-          s.leftShare = 0.5;
-          s.rightShare = 0.5;
-        } else {
-          s.leftShare = cover[i + 1] / c;
-          s.rightShare = cover[n.right] / c;
-          if (!std::isfinite(s.leftShare) || !std::isfinite(s.rightShare)) {
-            throw std::invalid_argument(where + ", node " + std::to_string(i) +
-                                        ": a child's cover divided by this node's cover " +
-                                        std::to_string(c) + " overflows");
-          }
+        s.sameEdge = kNone;
+        parent[i + 1] = i;
+        parent[n.right] = i;
+      }
+      if (parent[i] != kNone) {
+        const uint32_t p = parent[i];
+        const double c = cover[p];
+        s.share = c == 0.0 ? 0.5 : cover[i] / c;
+        if (!std::isfinite(s.share)) {
+          throw std::invalid_argument(where + ", node " + std::to_string(p) +
+                                      ": a child's cover divided by this node's cover " +
+                                      std::to_string(c) + " overflows");
         }
       }
       nodes_.push_back(s);
     }
+    ShapNode* nodes = nodes_.data() + shapTree.first;
+
+    // Down the tree in pre-order: each edge's merged share of its position,
+    // each split's nearest edge on its own position, and the most distinct
+    // positions on a path.
+    uint32_t distinct = 0;
+    uint32_t mostDistinct = 0;
+    path.clear();
+    for (uint32_t i = 0; i < size; ++i) {
+      while (!path.empty() && path.back().node != parent[i]) {
+        const uint32_t up = path.back().node;
+        lastEdge[static_cast<size_t>(nodes[parent[up]].position)] = path.back().replaced;
+        if (path.back().replaced == kNone) --distinct;
+        path.pop_back();
+      }
+      if (i != 0) {
+        auto& slot = lastEdge[static_cast<size_t>(nodes[parent[i]].position)];
+        nodes[i].zero = nodes[i].share * (slot == kNone ? 1.0 : nodes[slot].zero);
+        if (slot == kNone) ++distinct;
+        path.push_back({i, slot});
+        slot = i;
+      } else {
+        path.push_back({i, kNone});
+      }
+      if (nodes[i].position == kLeaf) {
+        mostDistinct = std::max(mostDistinct, distinct);
+      } else {
+        nodes[i].sameEdge = lastEdge[static_cast<size_t>(nodes[i].position)];
+      }
+    }
+    while (path.size() > 1) {  // leave lastEdge clear for the next tree
+      const uint32_t up = path.back().node;
+      lastEdge[static_cast<size_t>(nodes[parent[up]].position)] = path.back().replaced;
+      path.pop_back();
+    }
+    if (mostDistinct > kMaxPolynomialPositions) {
+      shapTree.points = kPublished;
+    } else {
+      shapTree.points = (mostDistinct + 1) / 2;
+      if (rules_.size() <= shapTree.points) rules_.resize(shapTree.points + 1);
+      Quadrature& rule = rules_[shapTree.points];
+      if (shapTree.points > 0 && rule.point.empty()) {
+        gaussLegendre(shapTree.points, rule.point, rule.weight);
+        for (size_t q = 0; q < shapTree.points; ++q) {
+          rule.point[q] = 0.5 + 0.5 * rule.point[q];
+          rule.weight[q] = 0.5 * rule.weight[q];
+          rule.unknownFactor.push_back(-rule.weight[q] / (1.0 - rule.point[q]));
+        }
+      }
+    }
+
     // Cover-weighted mean of the leaves.
-    std::vector<std::pair<uint32_t, double>> pending{{shapTree.first, 1.0}};
+    std::vector<std::pair<uint32_t, double>> pending{{0, 1.0}};
     while (!pending.empty()) {
       const auto [i, share] = pending.back();
       pending.pop_back();
-      const ShapNode& s = nodes_[i];
+      const ShapNode& s = nodes[i];
       if (s.position == kLeaf) {
         shapTree.expectation += share * s.value;
         continue;
       }
-      pending.emplace_back(s.right, share * s.rightShare);
-      pending.emplace_back(i + 1, share * s.leftShare);
+      pending.emplace_back(s.right, share * nodes[s.right].share);
+      pending.emplace_back(i + 1, share * nodes[i + 1].share);
     }
     trees_.push_back(shapTree);
   }
@@ -229,7 +351,7 @@ TreeShap::TreeShap(const BoostingModel& model, const TreeCovers& covers)
   if (!constantScore_ && selector.weight != 0.0 && selector.tree && selector.tree->root) {
     layOut(selector.tree->root.get(), {}, tree);
     for (const PreorderNode& n : tree.nodes) {
-      ShapNode s{kLeaf, n.right, n.threshold, false, 0.0, 0.0, 0.0};
+      ShapNode s{kLeaf, n.right, n.threshold, false, 1.0, 1.0, {0.0}};
       if (n.node->isLeaf()) {
         s.value = static_cast<double>(static_cast<float>(static_cast<const ConstantNode*>(n.node)->value));
       } else {
@@ -241,6 +363,13 @@ TreeShap::TreeShap(const BoostingModel& model, const TreeCovers& covers)
 }
 
 TreeShap::~TreeShap() = default;
+
+size_t TreeShap::tableBytes() const {
+  size_t bytes = (nodes_.capacity() + selector_.capacity()) * sizeof(ShapNode) +
+                 trees_.capacity() * sizeof(ShapTree) + modelIndexMap_.capacity() * sizeof(uint32_t);
+  for (const Quadrature& rule : rules_) bytes += 3 * rule.point.capacity() * sizeof(double);
+  return bytes + rules_.capacity() * sizeof(Quadrature);
+}
 
 std::pair<size_t, size_t> TreeShap::selectTrees(const float* row) const {
   const size_t n = trees_.size();
@@ -261,43 +390,255 @@ std::pair<size_t, size_t> TreeShap::selectTrees(const float* row) const {
 
 double TreeShap::explain(const float* row, double* contributions, Scratch& scratch) const {
   if (constantScore_) return constantRawScore_;
-  std::fill(contributions, contributions + numPositions_, 0.0);
   const auto [first, end] = selectTrees(row);
+  explainBlock<1>(&row, first, end, &contributions, scratch);
   double bias = baseScore_;
-  for (size_t t = first; t < end; ++t) {
-    bias += trees_[t].expectation;
-    explainTree(trees_[t], row, contributions, scratch);
-  }
+  for (size_t t = first; t < end; ++t) bias += trees_[t].expectation;
   return bias;
 }
 
 void TreeShap::explainRows(const float* rows, size_t numRows, size_t stride, double* out) const {
   checkStride(numRows, stride, numPositions_, "explain");
-  Scratch scratch;
   const size_t width = numPositions_ + 1;
-  for (size_t r = 0; r < numRows; ++r) {
-    double* o = out + r * width;
-    o[numPositions_] = explain(rows + r * stride, o, scratch);
+  if (constantScore_) {
+    for (size_t r = 0; r < numRows; ++r) out[r * width + numPositions_] = constantRawScore_;
+    return;
+  }
+  // Rows that select the same trees go side by side.
+  std::vector<std::pair<std::pair<size_t, size_t>, size_t>> order(numRows);
+  for (size_t r = 0; r < numRows; ++r) order[r] = {selectTrees(rows + r * stride), r};
+  if (!selector_.empty()) std::sort(order.begin(), order.end());
+  Scratch scratch;
+  std::vector<double> discarded(numPositions_);
+  size_t i = 0;
+  while (i < numRows) {
+    const auto [first, end] = order[i].first;
+    size_t group = i;
+    while (group < numRows && order[group].first == order[i].first) ++group;
+    for (; i < group;) {
+      const size_t take = std::min(kBlock, group - i);
+      double bias = baseScore_;
+      for (size_t t = first; t < end; ++t) bias += trees_[t].expectation;
+      if (take < 3) {
+        for (size_t k = 0; k < take; ++k, ++i) {
+          const float* row = rows + order[i].second * stride;
+          double* o = out + order[i].second * width;
+          explainBlock<1>(&row, first, end, &o, scratch);
+          o[numPositions_] = bias;
+        }
+        continue;
+      }
+      // A short block repeats its last row into the spare lanes.
+      const float* blockRows[kBlock];
+      double* blockOut[kBlock];
+      for (size_t k = 0; k < kBlock; ++k) {
+        const size_t r = order[i + std::min(k, take - 1)].second;
+        blockRows[k] = rows + r * stride;
+        blockOut[k] = k < take ? out + r * width : discarded.data();
+      }
+      explainBlock<kBlock>(blockRows, first, end, blockOut, scratch);
+      for (size_t k = 0; k < take; ++k) blockOut[k][numPositions_] = bias;
+      i += take;
+    }
   }
 }
 
-// Path-dependent tree SHAP, walked with an explicit stack. Each visited node
-// holds the path of unique positions from the root: for each, the share of
-// the expectation that reaches this far when the position is unknown (zero)
-// or known (one: 1 if the row took the branches, 0 otherwise), and the
-// permutation weights of the subsets along the path. A node's path is a copy
-// of its parent's, extended by the split that leads to it; when a position
-// repeats, its earlier entry is unwound and merged into the new one.
-void TreeShap::explainTree(const ShapTree& tree, const float* row, double* contributions,
-                           Scratch& scratch) const {
+template <size_t K>
+void TreeShap::explainBlock(const float* const* rows, size_t first, size_t end, double* const* out,
+                            Scratch& scratch) const {
+  std::vector<double>& lanes = scratch.lanes;
+  lanes.assign(numPositions_ * K, 0.0);
+  for (size_t t = first; t < end; ++t) {
+    const ShapTree& tree = trees_[t];
+    if (tree.points == 0) continue;
+    if (tree.points == kPublished) {
+      for (size_t l = 0; l < K; ++l) explainTreePublished(tree, rows[l], lanes.data() + l, K, scratch);
+      continue;
+    }
+    explainTreeInLanes<K>(tree, rows, scratch);
+  }
+  for (size_t l = 0; l < K; ++l) {
+    for (size_t p = 0; p < numPositions_; ++p) out[l][p] = lanes[p * K + l];
+  }
+}
+
+namespace {
+
+// Rows side by side: K doubles that arithmetic treats lane by lane, each lane
+// exactly as a double alone (one rounding per operation, no contraction).
+template <size_t K>
+struct LaneTraits {
+  typedef double Lanes __attribute__((vector_size(K * sizeof(double))));
+};
+template <>
+struct LaneTraits<1> {
+  using Lanes = double;
+};
+
+template <size_t K>
+using Lanes = typename LaneTraits<K>::Lanes;
+
+// Loads and stores that need no alignment. These stay within this file, so
+// the note that wide vectors pass differently without AVX-512 is moot.
+#if defined(__GNUC__) && !defined(__clang__)
+#pragma GCC diagnostic ignored "-Wpsabi"
+#endif
+template <typename V>
+inline V loadLanes(const double* p) {
+  V v;
+  std::memcpy(&v, p, sizeof v);
+  return v;
+}
+
+template <typename V>
+inline void storeLanes(double* p, const V& v) {
+  std::memcpy(p, &v, sizeof v);
+}
+
+}  // namespace
+
+// The polynomial walk over one tree for K rows in lanes. Arrays are indexed
+// [node][point][lane]; `products` holds, on the way down, each node's product
+// over the positions on its path of (o y + z (1 - y)) at the points, and once
+// a split's children have theirs, it collects the leaf sums that the split's
+// deeper namesakes take away from the edge into it.
+template <size_t K>
+void TreeShap::explainTreeInLanes(const ShapTree& tree, const float* const* rows, Scratch& scratch) const {
+  using V = Lanes<K>;
+  const ShapNode* nodes = nodes_.data() + tree.first;
+  const size_t size = tree.size;
+  const size_t points = tree.points;
+  const Quadrature& rule = rules_[points];
+  const double* y = rule.point.data();
+  const size_t cells = size * points * K;
+  if (scratch.products.size() < cells) {
+    scratch.products.resize(cells);
+    scratch.sums.resize(cells);
+  }
+  if (scratch.known.size() < size * K) scratch.known.resize(size * K);
+  if (scratch.inverses.size() < size * points * 2) scratch.inverses.resize(size * points * 2);
+  double* const product = scratch.products.data();
+  double* const sum = scratch.sums.data();
+  double* const known = scratch.known.data();
+  double* const inverse = scratch.inverses.data();
+  double* const lanes = scratch.lanes.data();
+
+  // Per node and point, the inverse of its factor for a row that takes the
+  // node's branches, 1 / (y + z (1 - y)), and for one that does not,
+  // 1 / (z (1 - y)) (0 when z is 0: everything below is 0 then).
+  for (size_t c = 1; c < size; ++c) {
+    const double z = nodes[c].zero;
+    // Kept finite, so that multiplying it by 0 gives 0: a z this small
+    // leaves nothing of the path anyway.
+    const double inverseZero = z == 0.0 ? 0.0 : std::min(1.0 / z, 1e300);
+    for (size_t q = 0; q < points; ++q) {
+      const double unknown = 1.0 - y[q];
+      inverse[(c * points + q) * 2] = 1.0 / (y[q] + z * unknown);
+      inverse[(c * points + q) * 2 + 1] = inverseZero / unknown;
+    }
+  }
+
+  // Down: each child's product is its parent's without the factor of the
+  // parent's position, times the merged factor of that position. Known is 1
+  // or 0, so known * y + z (1 - y) is exactly one of the two factors, and
+  // k * a + (1 - k) * b exactly a or b: choices are made by arithmetic, not
+  // by branches, as rows in lanes go every which way.
+  std::fill(product, product + points * K, 1.0);
+  for (size_t s = 0; s < size; ++s) {
+    const ShapNode& n = nodes[s];
+    if (n.position == kLeaf) continue;
+    const size_t left = s + 1;
+    const size_t right = n.right;
+    const uint32_t e = n.sameEdge;
+    double was[K];
+    for (size_t l = 0; l < K; ++l) {
+      const float x = rows[l][n.position];
+      const bool goes = goesRight(tree.equalityWalk, s == 0, n.equality, x, n.threshold);
+      was[l] = e == kNone ? 1.0 : known[e * K + l];
+      known[right * K + l] = was[l] != 0.0 && goes ? 1.0 : 0.0;
+      known[left * K + l] = was[l] != 0.0 && !goes ? 1.0 : 0.0;
+    }
+    const V before = loadLanes<V>(was);
+    const V knownLeft = loadLanes<V>(known + left * K);
+    const V knownRight = loadLanes<V>(known + right * K);
+    const double zeroLeft = nodes[left].zero;
+    const double zeroRight = nodes[right].zero;
+    for (size_t q = 0; q < points; ++q) {
+      const double unknown = 1.0 - y[q];
+      double* const p = product + (s * points + q) * K;
+      V base = loadLanes<V>(p);
+      if (e != kNone) {
+        const double takenInverse = inverse[(e * points + q) * 2];
+        const double missedInverse = inverse[(e * points + q) * 2 + 1];
+        base = base * (before * takenInverse + (1.0 - before) * missedInverse);
+      }
+      storeLanes(product + (left * points + q) * K, base * (knownLeft * y[q] + zeroLeft * unknown));
+      storeLanes(product + (right * points + q) * K, base * (knownRight * y[q] + zeroRight * unknown));
+      std::fill(p, p + K, 0.0);
+    }
+  }
+
+  // Up: a split's children are done before it. The edge into child c adds
+  // (o - z) * sum_q w_q R(y_q) / factor(y_q) to the split's position, R being
+  // the sum of the leaves below c whose last test of that position is this
+  // edge; (o - z) / factor is (1 - z) / (y + z (1 - y)) for o = 1 and
+  // -1 / (1 - y) for o = 0.
+  for (size_t s = size; s-- > 0;) {
+    const ShapNode& n = nodes[s];
+    if (n.position == kLeaf) continue;
+    double* const out = lanes + static_cast<size_t>(n.position) * K;
+    for (const size_t c : {s + 1, static_cast<size_t>(n.right)}) {
+      const ShapNode& child = nodes[c];
+      const bool leaf = child.position == kLeaf;
+      const V knownChild = loadLanes<V>(known + c * K);
+      V total = loadLanes<V>(out) * 0.0;
+      for (size_t q = 0; q < points; ++q) {
+        double* const sc = sum + (c * points + q) * K;
+        const V pc = loadLanes<V>(product + (c * points + q) * K);
+        // For a row that takes the edge's branches, and for one that does not.
+        const double taken = rule.weight[q] * (1.0 - child.zero) * inverse[(c * points + q) * 2];
+        const double missed = rule.unknownFactor[q];
+        V r;
+        if (leaf) {
+          r = child.value * pc;
+          storeLanes(sc, r);
+        } else {
+          r = loadLanes<V>(sc) + pc;
+        }
+        total += r * (knownChild * taken + (1.0 - knownChild) * missed);
+      }
+      storeLanes(out, loadLanes<V>(out) + total);
+    }
+    for (size_t q = 0; q < points; ++q) {
+      const V whole = loadLanes<V>(sum + ((s + 1) * points + q) * K) + loadLanes<V>(sum + (n.right * points + q) * K);
+      storeLanes(sum + (s * points + q) * K, whole);
+      if (n.sameEdge != kNone) {
+        double* const r = product + (n.sameEdge * points + q) * K;
+        storeLanes(r, loadLanes<V>(r) - whole);
+      }
+    }
+  }
+}
+
+// Path-dependent tree SHAP as published, walked with an explicit stack. Each
+// visited node holds the path of unique positions from the root: for each,
+// the share of the expectation that reaches this far when the position is
+// unknown (zero) or known (one: 1 if the row took the branches, 0 otherwise),
+// and the permutation weights of the subsets along the path. A node's path is
+// a copy of its parent's, extended by the split that leads to it; when a
+// position repeats, its earlier entry is unwound and merged into the new one.
+// Contributions go to contributions[position * stride].
+void TreeShap::explainTreePublished(const ShapTree& tree, const float* row, double* contributions,
+                                    size_t stride, Scratch& scratch) const {
   using PathEntry = Scratch::PathEntry;
   using Frame = Scratch::Frame;
+  const ShapNode* nodes = nodes_.data() + tree.first;
   std::vector<PathEntry>& paths = scratch.paths;
   std::vector<Frame>& frames = scratch.frames;
   frames.clear();
   // Frame: the node, where its parent's path lies (pathStart, pathLength
   // entries) and the entry that the edge into the node adds.
-  frames.push_back({tree.first, 0, 0, 1.0, 1.0, -1});
+  frames.push_back({0, 0, 0, 1.0, 1.0, -1});
   while (!frames.empty()) {
     const Frame f = frames.back();
     frames.pop_back();
@@ -315,7 +656,7 @@ void TreeShap::explainTree(const ShapTree& tree, const float* row, double* contr
       m[i].weight = f.zero * m[i].weight * static_cast<double>(l - i) / lp1;
     }
 
-    const ShapNode& node = nodes_[f.node];
+    const ShapNode& node = nodes[f.node];
     if (node.position == kLeaf) {
       for (uint32_t i = 1; i <= l; ++i) {
         // Sum of the path weights with entry i unwound.
@@ -333,18 +674,18 @@ void TreeShap::explainTree(const ShapTree& tree, const float* row, double* contr
             total += (m[j].weight / zero) / lj;
           }
         }
-        contributions[m[i].position] += total * (m[i].one - m[i].zero) * node.value;
+        contributions[static_cast<size_t>(m[i].position) * stride] +=
+            total * (m[i].one - m[i].zero) * node.value;
       }
       continue;
     }
 
     const float x = readPosition(row, numPositions_, node.position);
-    const bool right = goesRight(tree.equalityWalk, f.node == tree.first, node.equality, x,
-                                 node.threshold);
+    const bool right = goesRight(tree.equalityWalk, f.node == 0, node.equality, x, node.threshold);
     const uint32_t hot = right ? node.right : f.node + 1;
     const uint32_t cold = right ? f.node + 1 : node.right;
-    const double hotShare = right ? node.rightShare : node.leftShare;
-    const double coldShare = right ? node.leftShare : node.rightShare;
+    const double hotShare = nodes[hot].share;
+    const double coldShare = nodes[cold].share;
 
     double zero = 1.0;
     double one = 1.0;

@@ -32,6 +32,19 @@
 // many background rows reach each node, following the branches that scoring
 // takes.
 //
+// Method: for one leaf of value v whose path tests d distinct positions, the
+// share of position i is
+//   v * (o_i - z_i) * integral over y in [0, 1] of prod_{j != i} (o_j y + z_j (1 - y)),
+// where z_j is the product of the shares of the path's edges that test j and
+// o_j is 1 when the row takes all of them, else 0. The integrand is a
+// polynomial of degree below d, so a Gauss-Legendre rule of ceil(d / 2)
+// points integrates it exactly. A walk down the tree carries each node's
+// product at those points, a walk up sums the leaves and hands each edge its
+// share: O(nodes x points) per tree and row, with rows side by side in lanes.
+// Every row's arithmetic is the same in a lane as alone, so explainRows() and
+// explain() agree to the bit. A tree whose paths test more than 32 distinct
+// positions takes the published path-by-path walk, O(leaves x depth^2).
+//
 // A model without featureMapping has no positions and one constant score:
 // explain() writes nothing and returns that score as the bias.
 //
@@ -40,8 +53,8 @@
 //
 // Threads: immutable after construction. Any number of threads may call the
 // const methods at once, each with its own Scratch. explain() allocates only
-// when its Scratch is first used (or meets a deeper tree); explainRows()
-// allocates one Scratch per call.
+// when its Scratch is first used (or meets a larger tree); explainRows()
+// allocates one Scratch and a row order per call.
 //
 // Errors: the constructor throws std::invalid_argument, naming the tree and
 // the node, for covers of the wrong shape, a cover that is negative, NaN or
@@ -78,6 +91,7 @@ class TreeShap {
 
    private:
     friend class TreeShap;
+    // The published walk (deep trees).
     struct PathEntry {
       int32_t position;  // -1 for the entry the root starts with
       double zero;       // share of the path when the position is unknown
@@ -94,6 +108,12 @@ class TreeShap {
     };
     std::vector<PathEntry> paths;
     std::vector<Frame> frames;
+    // The polynomial walk, for a block of rows in lanes.
+    std::vector<double> products;   // per node, point and lane
+    std::vector<double> sums;       // per node, point and lane
+    std::vector<double> known;      // per node and lane: 1 or 0
+    std::vector<double> inverses;   // per node and point: two factors
+    std::vector<double> lanes;      // per position and lane: contributions
   };
 
   // Throws std::invalid_argument for covers that do not fit the model (see
@@ -106,36 +126,62 @@ class TreeShap {
   // Number of contributions per row: the model's vectorLength().
   size_t numContributions() const { return numPositions_; }
 
+  // Bytes held for explaining: the per-node tables and quadrature rules.
+  size_t tableBytes() const;
+
   // Writes numContributions() contributions of `row` (vectorLength() floats)
   // to `contributions` and returns the bias.
   double explain(const float* row, double* contributions, Scratch& scratch) const;
 
   // Explains `numRows` rows: row r is rows[r * stride, r * stride +
   // numContributions()). out has numRows * (numContributions() + 1) entries;
-  // row r's contributions come first, then its bias.
+  // row r's contributions come first, then its bias. Gives the same bits as
+  // explain() row by row.
   void explainRows(const float* rows, size_t numRows, size_t stride, double* out) const;
 
  private:
+  static constexpr size_t kBlock = 8;  // rows explained together
+
   struct ShapNode {
-    int32_t position;    // split: vector position; kLeaf for a leaf
-    uint32_t right;      // split: index of the right child (left is next)
-    float threshold;     // split: compiled threshold
-    bool equality;       // split: an equality split (x != t goes right)
-    double leftShare;    // split: cover(left) / cover(split)
-    double rightShare;   // split: cover(right) / cover(split)
-    double value;        // leaf: compiled value, widened
+    int32_t position;  // split: vector position; kLeaf for a leaf
+    uint32_t right;    // split: the right child, counted from the tree's root
+    float threshold;   // split: compiled threshold
+    bool equality;     // split: an equality split (x != t goes right)
+    double share;      // cover(node) / cover(parent); 1/2 each under a zero cover
+    double zero;       // product of the shares of the edges on the path that
+                       // test the parent's position, down to this node
+    union {
+      double value;       // leaf: compiled value, widened
+      uint32_t sameEdge;  // split: nearest node at or above this one whose
+                          // parent tests this node's position, or kNone
+    };
   };
   struct ShapTree {
-    uint32_t first;        // first node in nodes_
-    uint32_t depth;        // splits on the longest path
-    bool equalityWalk;     // the tree tests an equality feature
-    double expectation;    // cover-weighted mean of the leaves
+    uint32_t first;      // first node in nodes_
+    uint32_t size;       // its nodes
+    uint32_t depth;      // splits on the longest path
+    uint32_t points;     // quadrature points; 0 without splits; kPublished
+    bool equalityWalk;   // the tree tests an equality feature
+    double expectation;  // cover-weighted mean of the leaves
+  };
+  // Gauss-Legendre rule on [0, 1].
+  struct Quadrature {
+    std::vector<double> point;
+    std::vector<double> weight;
+    std::vector<double> unknownFactor;  // -weight / (1 - point)
   };
   static constexpr int32_t kLeaf = -1;
+  static constexpr uint32_t kNone = 0xffffffffu;
+  static constexpr uint32_t kPublished = 0xffffffffu;
 
   std::pair<size_t, size_t> selectTrees(const float* row) const;
-  void explainTree(const ShapTree& tree, const float* row, double* contributions,
-                   Scratch& scratch) const;
+  template <size_t K>
+  void explainBlock(const float* const* rows, size_t first, size_t end, double* const* out,
+                    Scratch& scratch) const;
+  template <size_t K>
+  void explainTreeInLanes(const ShapTree& tree, const float* const* rows, Scratch& scratch) const;
+  void explainTreePublished(const ShapTree& tree, const float* row, double* contributions,
+                            size_t stride, Scratch& scratch) const;
 
   size_t numPositions_ = 0;
   bool constantScore_ = false;
@@ -143,6 +189,7 @@ class TreeShap {
   double baseScore_ = 0.0;
   std::vector<ShapNode> nodes_;
   std::vector<ShapTree> trees_;  // the trees of non-zero weight, in order
+  std::vector<Quadrature> rules_;  // by number of points
   // The selector, as plain splits without shares; empty without one.
   std::vector<ShapNode> selector_;
   std::vector<uint32_t> modelIndexMap_;

@@ -164,7 +164,7 @@ TEST(AgainstBruteForce, SmallForestsWithNaNsThresholdsEqualityAndSelector) {
   for (uint64_t seed = 1; seed <= 120; ++seed) {
     std::mt19937_64 rng(seed);
     const auto n = static_cast<int32_t>(1 + seed % 8);
-    const int depth = 1 + static_cast<int>(seed % 4);
+    const int depth = 1 + static_cast<int>(seed % 6);
     Forest f = test::randomForest(seed, 2 + seed % 4, depth, n, true, 0.3);
     std::vector<float> pivots;
     for (auto& w : f.trees) collectPivots(w.tree->root.get(), rng, pivots);
@@ -237,6 +237,89 @@ TEST(SumProperty, LargerForestsWithBackgroundCovers) {
       EXPECT_NEAR(sum, raw[r], 1e-9 * scale) << "seed " << seed << " row " << r;
     }
   }
+}
+
+std::vector<float> randomRows(std::mt19937_64& rng, size_t count, size_t width, const std::vector<float>& pivots) {
+  std::uniform_int_distribution<int> kind(0, 5);
+  std::uniform_real_distribution<float> uniform(-1.2f, 1.2f);
+  std::vector<float> rows(count * width);
+  for (float& x : rows) {
+    const int k = kind(rng);
+    x = k == 0 ? kNaN : k == 1 && !pivots.empty() ? pivots[rng() % pivots.size()] : uniform(rng);
+  }
+  return rows;
+}
+
+TEST(Rows, BlocksOfRowsGiveTheBitsOfSingleRows) {
+  // Three sub-models, so that rows are regrouped; 45 rows give full blocks,
+  // padded ones and single rows.
+  Forest f = test::randomForest(7, 30, 6, 12, true, 0.25);
+  f.equalityFeatures = {2};
+  f.modelSelector = weighted(split(0, -0.3, leaf(0.0), split(1, 0.4, leaf(1.0), leaf(2.9))), 1.0);
+  f.modelIndexMap = {10, 20};
+  std::mt19937_64 rng(7);
+  std::vector<float> pivots;
+  for (auto& w : f.trees) collectPivots(w.tree->root.get(), rng, pivots);
+  const auto model = load(f);
+  const size_t width = 12;
+  const std::vector<float> background = randomRows(rng, 50, width, pivots);
+  const TreeShap shap(*model, backgroundCovers(*model, background.data(), 50, width));
+  for (const size_t count : {45u, 5u, 2u}) {
+    // Rows 13 apart, to check the stride.
+    std::vector<float> rows = randomRows(rng, count, 13, pivots);
+    std::vector<double> out(count * (width + 1));
+    shap.explainRows(rows.data(), count, 13, out.data());
+    TreeShap::Scratch scratch;
+    for (size_t r = 0; r < count; ++r) {
+      std::vector<double> phi(width);
+      const double bias = shap.explain(rows.data() + r * 13, phi.data(), scratch);
+      EXPECT_EQ(out[r * (width + 1) + width], bias) << "row " << r;
+      for (size_t i = 0; i < width; ++i) EXPECT_EQ(out[r * (width + 1) + i], phi[i]) << "row " << r;
+    }
+  }
+}
+
+// A tree whose path tests more than 32 positions takes another walk. Hang a
+// chain of 40 splits on positions 6 to 45 below each tree, behind an edge
+// without cover that no finite row takes: the contributions must stay those
+// of the tree without it.
+TEST(DeepTrees, ManyPositionsOnAPathExplainAsWithout) {
+  const int32_t width = 46;
+  Forest plain = test::randomForest(5, 8, 5, 6, false, 0.2);
+  Forest deep = test::randomForest(5, 8, 5, 6, false, 0.2);
+  deep.featureMapping.clear();
+  for (int32_t i = 0; i < width; ++i) {
+    deep.featureMapping.push_back(static_cast<uint32_t>(i + 1));
+  }
+  plain.featureMapping = deep.featureMapping;
+  std::mt19937_64 rng(5);
+  TreeCovers plainCovers;
+  TreeCovers deepCovers;
+  for (size_t t = 0; t < deep.trees.size(); ++t) {
+    plainCovers.emplace_back();
+    addCovers(rng, plain.trees[t].tree->root.get(), 500.0, plainCovers.back());
+    std::unique_ptr<Node> chain = leaf(3.0);
+    for (int32_t p = width - 1; p >= 6; --p) chain = split(p, 0.0, leaf(-2.0), std::move(chain));
+    // Every finite row goes left at a split on the largest float.
+    auto& root = deep.trees[t].tree->root;
+    root = split(0, std::numeric_limits<float>::max(), std::move(root), std::move(chain));
+    deepCovers.emplace_back(1, 500.0);
+    deepCovers.back().insert(deepCovers.back().end(), plainCovers.back().begin(), plainCovers.back().end());
+    deepCovers.back().resize(deepCovers.back().size() + 81, 0.0);
+  }
+  const auto plainModel = load(plain);
+  const auto deepModel = load(deep);
+  const TreeShap plainShap(*plainModel, plainCovers);
+  const TreeShap deepShap(*deepModel, deepCovers);
+  // Without NaN: the new root would send it into the chain, and the old root
+  // would send it the other way.
+  std::vector<float> rows = randomRows(rng, 20, static_cast<size_t>(width), {});
+  for (float& x : rows) x = std::isnan(x) ? 0.5f : x;
+  std::vector<double> expected(20 * (width + 1));
+  std::vector<double> actual(20 * (width + 1));
+  plainShap.explainRows(rows.data(), 20, width, expected.data());
+  deepShap.explainRows(rows.data(), 20, width, actual.data());
+  for (size_t i = 0; i < actual.size(); ++i) EXPECT_NEAR(actual[i], expected[i], 1e-12) << "entry " << i;
 }
 
 // baseScore 0.5; a zero-weight tree first, then
