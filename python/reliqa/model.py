@@ -6,7 +6,7 @@ import json
 import math
 import os
 import tempfile
-from typing import Any, Iterable, Mapping, Optional, Sequence, Union
+from typing import Any, Iterable, List, Mapping, Optional, Sequence, Tuple, Union
 
 import numpy as np
 
@@ -170,30 +170,63 @@ class Model:
         numpy.ndarray
             float64, one score per row.
         """
-        if missing is not None:
-            missing = float(missing)
-        nthread = int(nthread)
-        if nthread == -1:
-            nthread = 0
-        if not 0 <= nthread <= 4096:
-            raise ValueError(f"nthread must be -1 or 0 (every core) up to 4096, got {nthread}")
+        missing, nthread = _missing_and_threads(missing, nthread)
         if feature_ids is None and type(X) is np.ndarray and X.dtype in _FLOATS:
             return self._native.predict(X, None, missing, bool(output_margin), nthread)
-        column_ids = None
-        if _is_dataframe(X):
-            column_ids = _feature_ids(X.columns, what="column")
-            if feature_ids is not None:
-                raise ValueError("feature_ids is for arrays; a DataFrame names its columns itself")
-            X = _frame_values(X)
-        elif feature_ids is not None:
-            column_ids = _feature_ids(feature_ids, what="feature_ids item")
-        if not isinstance(X, np.ndarray):
-            raise TypeError(f"X must be a numpy array or a pandas DataFrame, not {type(X).__name__}")
-        if X.dtype not in _FLOATS:
-            if not (np.issubdtype(X.dtype, np.number) or X.dtype == np.bool_) or np.iscomplexobj(X):
-                raise ValueError(f"X must hold real numbers, got {X.dtype}")
-            X = X.astype(np.float64)  # other number types: one copy, as doubles
+        X, column_ids = _matrix(X, feature_ids, what="X")
         return self._native.predict(X, column_ids, missing, bool(output_margin), nthread)
+
+    def contributions(
+        self,
+        X: Any,
+        *,
+        feature_ids: Optional[Sequence[Union[int, str]]] = None,
+        background: Any = None,
+        missing: _Missing = math.nan,
+        nthread: int = 0,
+    ) -> np.ndarray:
+        """Exact per-feature contributions (Shapley values) to each row's raw
+        score, by path-dependent tree SHAP.
+
+        For every row, the bias plus the contributions is the raw score that
+        ``predict(X, output_margin=True)`` gives (up to rounding). The trees
+        and branches are exactly those of scoring: with a model selector only
+        the selected sub-model is explained (the selector itself gets no
+        share).
+
+        Parameters
+        ----------
+        X, feature_ids, missing:
+            As for :meth:`predict`.
+        background:
+            Rows (an array with the columns of an array `X`, or a
+            DataFrame naming its own) whose
+            counts through each tree node serve as the node covers: the
+            logged feature vectors of real traffic, for instance. Without it
+            the model must come from :meth:`from_xgboost`, which keeps the
+            trainer's covers; a model read from its text has none.
+        nthread:
+            As for :meth:`predict`; every count gives the same bits.
+
+        Returns
+        -------
+        numpy.ndarray
+            float64 of shape ``(n, k + 1)``: column ``i < k`` is the
+            contribution of feature :attr:`feature_ids` ``[i]``, the last
+            column is the bias (the expected raw score).
+
+        Raises
+        ------
+        ValueError
+            Without covers, or for rows that do not fit the model.
+        """
+        missing, nthread = _missing_and_threads(missing, nthread)
+        X, column_ids = _matrix(X, feature_ids, what="X")
+        background_ids = None
+        if background is not None:
+            ids = None if _is_dataframe(background) else feature_ids
+            background, background_ids = _matrix(background, ids, what="background")
+        return self._native.contributions(X, column_ids, background, background_ids, missing, nthread)
 
     def predict_rows(
         self,
@@ -217,12 +250,53 @@ class Model:
         return self._native.predict_rows(rows, missing, bool(output_margin))
 
     def __reduce__(self):
-        # Pickled as its text: a model crosses to other processes (joblib,
-        # multiprocessing) and loads there as here.
-        return (Model, (self.text,))
+        # Pickled as its text (and the trainer's covers, when it has them): a
+        # model crosses to other processes (joblib, multiprocessing) and
+        # loads there as here.
+        covers = self._native.covers
+        if covers is None:
+            return (Model, (self.text,))
+        return (_with_covers, (self.text, covers))
 
     def __repr__(self) -> str:
         return f"<reliqa.Model: {self.num_trees} trees over {len(self.feature_ids)} features>"
+
+
+def _with_covers(text: bytes, covers: np.ndarray) -> Model:
+    model = Model(text)
+    model._native.set_covers(covers)
+    return model
+
+
+def _missing_and_threads(missing: _Missing, nthread: int) -> Tuple[Optional[float], int]:
+    if missing is not None:
+        missing = float(missing)
+    nthread = int(nthread)
+    if nthread == -1:
+        nthread = 0
+    if not 0 <= nthread <= 4096:
+        raise ValueError(f"nthread must be -1 or 0 (every core) up to 4096, got {nthread}")
+    return missing, nthread
+
+
+def _matrix(X: Any, feature_ids: Optional[Sequence[Union[int, str]]], *, what: str) -> Tuple[np.ndarray, Optional[List[int]]]:
+    """`X` as a float array the native side reads without a copy, and the
+    feature id of each of its columns (None: the model's own order)."""
+    column_ids = None
+    if _is_dataframe(X):
+        column_ids = _feature_ids(X.columns, what="column")
+        if feature_ids is not None:
+            raise ValueError("feature_ids is for arrays; a DataFrame names its columns itself")
+        X = _frame_values(X)
+    elif feature_ids is not None:
+        column_ids = _feature_ids(feature_ids, what="feature_ids item")
+    if not isinstance(X, np.ndarray):
+        raise TypeError(f"{what} must be a numpy array or a pandas DataFrame, not {type(X).__name__}")
+    if X.dtype not in _FLOATS:
+        if not (np.issubdtype(X.dtype, np.number) or X.dtype == np.bool_) or np.iscomplexobj(X):
+            raise ValueError(f"{what} must hold real numbers, got {X.dtype}")
+        X = X.astype(np.float64)  # other number types: one copy, as doubles
+    return X, column_ids
 
 
 def _is_dataframe(x: Any) -> bool:

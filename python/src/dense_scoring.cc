@@ -56,11 +56,7 @@ void scoreRange(const thornvale::BoostingModel& model, const Matrix& x, const st
     std::vector<float> block(std::min(kBlockRows, end - first) * length);
     for (size_t at = first; at < end; at += kBlockRows) {
       const size_t n = std::min(kBlockRows, end - at);
-      if (x.isDouble) {
-        fillBlock<double>(x, columns, missing, at, n, block.data());
-      } else {
-        fillBlock<float>(x, columns, missing, at, n, block.data());
-      }
+      featureVectors(x, columns, missing, at, n, block.data());
       model.rawScores(block.data(), n, length, out + at);
     }
   }
@@ -91,22 +87,35 @@ std::vector<int64_t> columnsForModel(const thornvale::BoostingModel& model, cons
   return columns;
 }
 
-void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
-                std::optional<double> missing, bool probability, unsigned threads, double* out) {
+void featureVectors(const Matrix& x, const std::vector<int64_t>& columns, std::optional<double> missing,
+                    size_t first, size_t n, float* out) {
+  if (x.isDouble) {
+    fillBlock<double>(x, columns, missing, first, n, out);
+  } else {
+    fillBlock<float>(x, columns, missing, first, n, out);
+  }
+}
+
+namespace {
+
+// Runs work(first, end) over `rows` rows cut into one range per thread (0:
+// one per core), with at least `minRows` rows a thread. The ranges depend
+// only on the thread count, and each row's result on nothing but the row.
+template <typename Work>
+void inThreads(size_t rows, unsigned threads, size_t minRows, const Work& work) {
   // Asking costs a read of /sys each time; the answer does not change.
   static const unsigned cores = std::max(1u, std::thread::hardware_concurrency());
   if (threads == 0) threads = cores;
-  // At least a few blocks per thread, or threads cost more than they give.
-  const size_t useful = std::max<size_t>(1, x.rows / (4 * kBlockRows));
+  const size_t useful = std::max<size_t>(1, rows / minRows);
   const size_t count = std::min<size_t>(threads, useful);
   if (count <= 1) {
-    scoreRange(model, x, columns, missing, probability, 0, x.rows, out);
+    work(0, rows);
     return;
   }
   std::vector<std::exception_ptr> failures(count);
-  const auto work = [&](size_t t) {
+  const auto run = [&](size_t t) {
     try {
-      scoreRange(model, x, columns, missing, probability, x.rows * t / count, x.rows * (t + 1) / count, out);
+      work(rows * t / count, rows * (t + 1) / count);
     } catch (...) {
       failures[t] = std::current_exception();
     }
@@ -115,16 +124,44 @@ void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const st
   workers.reserve(count);
   size_t started = 1;  // range 0 is this thread's
   try {
-    for (; started < count; ++started) workers.emplace_back(work, started);
+    for (; started < count; ++started) workers.emplace_back(run, started);
   } catch (const std::system_error&) {
-    // No more threads to be had: this one scores the ranges left over.
+    // No more threads to be had: this one takes the ranges left over.
   }
-  work(0);
-  for (size_t t = started; t < count; ++t) work(t);
+  run(0);
+  for (size_t t = started; t < count; ++t) run(t);
   for (auto& w : workers) w.join();
   for (const auto& f : failures) {
     if (f) std::rethrow_exception(f);
   }
+}
+
+// Rows explained per call of explainRows(): a few lanes' worth.
+constexpr size_t kExplainRows = 32;
+
+}  // namespace
+
+void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
+                std::optional<double> missing, bool probability, unsigned threads, double* out) {
+  // At least a few blocks per thread, or threads cost more than they give.
+  inThreads(x.rows, threads, 4 * kBlockRows, [&](size_t first, size_t end) {
+    scoreRange(model, x, columns, missing, probability, first, end, out);
+  });
+}
+
+void explainDense(const thornvale::TreeShap& shap, const Matrix& x, const std::vector<int64_t>& columns,
+                  std::optional<double> missing, unsigned threads, double* out) {
+  const size_t length = columns.size();
+  const size_t width = shap.numContributions() + 1;
+  // A row costs far more to explain than to score: threads pay off early.
+  inThreads(x.rows, threads, 8, [&](size_t first, size_t end) {
+    std::vector<float> block(std::min(kExplainRows, end - first) * length);
+    for (size_t at = first; at < end; at += kExplainRows) {
+      const size_t n = std::min(kExplainRows, end - at);
+      featureVectors(x, columns, missing, at, n, block.data());
+      shap.explainRows(block.data(), n, length, out + at * width);
+    }
+  });
 }
 
 }  // namespace reliqa::python

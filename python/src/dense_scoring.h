@@ -13,6 +13,9 @@
 //
 // isMissing() is that rule for one cell.
 //
+// featureVectors() writes `n` rows from `first` on as feature vectors of
+// columns.size() floats each, by the same rule.
+//
 // scoreDense() fills `out[r]` with the raw score (or, with `probability`, its
 // logistic) of row r, splitting the rows across `threads` threads (0: one per
 // core). The result does not depend on the thread count. Each thread holds
@@ -21,6 +24,10 @@
 // call, which may run without the Python interpreter's lock. Throws what
 // the model throws; a thread's failure is rethrown in the caller, and a
 // thread that cannot be started leaves its rows to the caller's thread.
+//
+// explainDense() does the same for contributions: row r's
+// shap.numContributions() contributions and then its bias go to
+// out[r * (numContributions() + 1) ...], by the same threads and rules.
 #pragma once
 
 #include <cmath>
@@ -30,6 +37,7 @@
 #include <vector>
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/TreeShap.h"
 
 namespace reliqa::python {
 
@@ -54,7 +62,13 @@ bool isMissing(Cell v, std::optional<double> missing) {
   return std::isnan(*missing) ? std::isnan(v) : v == static_cast<Cell>(*missing);
 }
 
+void featureVectors(const Matrix& x, const std::vector<int64_t>& columns, std::optional<double> missing,
+                    size_t first, size_t n, float* out);
+
 void scoreDense(const thornvale::BoostingModel& model, const Matrix& x, const std::vector<int64_t>& columns,
                 std::optional<double> missing, bool probability, unsigned threads, double* out);
+
+void explainDense(const thornvale::TreeShap& shap, const Matrix& x, const std::vector<int64_t>& columns,
+                  std::optional<double> missing, unsigned threads, double* out);
 
 }  // namespace reliqa::python

@@ -30,8 +30,12 @@
 #include "tools/common/errors.h"
 #include "tools/common/feature_rows.h"
 #include "tools/common/quiet_stdout.h"
+#include "tools/common/xgboost_covers.h"
 #include "tools/common/xgboost_model.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/TreeShap.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/tree.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/WalkKernel.h"
 
@@ -119,13 +123,17 @@ class Model {
   Model(std::string text, std::string name, const std::string& walk)
       : text_(std::move(text)), model_(readModel(text_, name, walk)) {}
 
+  // A converted XGBoost model keeps the trainer's node covers, for
+  // contributions().
   static Model fromXgboost(const std::string& json, const std::string& name, const std::vector<int64_t>& ids) {
     std::string text;
     {
       QuietStdout quiet;  // the conversion reads its model back
       text = tool::convertXgboostJson(json, name, ids, "feature_ids=[...]").text;
     }
-    return Model(std::move(text), name, "");
+    Model model(std::move(text), name, "");
+    model.covers_ = tool::xgboostCovers(tool::readXgboostModel(json, name), *model.model_, name);
+    return model;
   }
 
   py::bytes text() const { return py::bytes(text_); }
@@ -142,40 +150,8 @@ class Model {
 
   py::array_t<double> predict(const py::array& x, std::optional<std::vector<int32_t>> columnIds,
                               std::optional<double> missing, bool outputMargin, unsigned nthread) const {
-    if (x.ndim() != 2) {
-      throw std::invalid_argument("X must be a 2-D array, got " + std::to_string(x.ndim()) + " dimensions");
-    }
-    Matrix m;
-    if (x.dtype().is(py::dtype::of<double>())) {
-      m.isDouble = true;
-    } else if (!x.dtype().is(py::dtype::of<float>())) {
-      throw std::invalid_argument("X must hold float32 or float64 values, got " +
-                                  py::str(x.dtype()).cast<std::string>());
-    }
-    m.data = static_cast<const char*>(x.data());
-    m.rows = static_cast<size_t>(x.shape(0));
-    m.cols = static_cast<size_t>(x.shape(1));
-    m.rowStride = x.strides(0);
-    m.colStride = x.strides(1);
-    std::vector<int64_t> columns;
-    if (columnIds) {
-      if (columnIds->size() != m.cols) {
-        throw std::invalid_argument("X has " + std::to_string(m.cols) + " columns but feature_ids names " +
-                                    std::to_string(columnIds->size()));
-      }
-      columns = columnsForModel(*model_, *columnIds);
-    } else {
-      const auto& mapping = model_->getForest().featureMapping;
-      if (mapping.size() != m.cols) {
-        throw std::invalid_argument("X has " + std::to_string(m.cols) + " columns but the model reads " +
-                                    std::to_string(mapping.size()) +
-                                    " features; give feature_ids to name the columns");
-      }
-      columns.assign(mapping.size(), -1);
-      for (size_t p = 0; p < mapping.size(); ++p) {
-        if (model_->getFeatureIndex().at(mapping[p]) == p) columns[p] = static_cast<int64_t>(p);
-      }
-    }
+    const Matrix m = matrixOf(x, "X");
+    const std::vector<int64_t> columns = columnsOf(m, columnIds, "X");
     py::array_t<double> out(static_cast<py::ssize_t>(m.rows));
     double* o = out.mutable_data();
     {
@@ -183,6 +159,90 @@ class Model {
       scoreDense(*model_, m, columns, missing, !outputMargin, nthread, o);
     }
     return out;
+  }
+
+  // Contributions of each row of `x` to its raw score, one column per
+  // position of the feature vector and then the bias. Node covers come from
+  // `background` (rows counted through the trees, with their own column ids)
+  // or from the XGBoost model this one was converted from.
+  py::array_t<double> contributions(const py::array& x, std::optional<std::vector<int32_t>> columnIds,
+                                    std::optional<py::array> background,
+                                    std::optional<std::vector<int32_t>> backgroundIds,
+                                    std::optional<double> missing, unsigned nthread) {
+    const Matrix m = matrixOf(x, "X");
+    const std::vector<int64_t> columns = columnsOf(m, columnIds, "X");
+    std::shared_ptr<const thornvale::TreeShap> shap;
+    if (background) {
+      const Matrix b = matrixOf(*background, "background");
+      const std::vector<int64_t> backgroundColumns = columnsOf(b, backgroundIds, "background");
+      if (b.rows == 0) {
+        throw std::invalid_argument("background has no rows; covers are counted over its rows");
+      }
+      const size_t length = backgroundColumns.size();
+      py::gil_scoped_release release;
+      std::vector<float> rows(b.rows * length);
+      featureVectors(b, backgroundColumns, missing, 0, b.rows, rows.data());
+      shap = std::make_shared<const thornvale::TreeShap>(
+          *model_, thornvale::backgroundCovers(*model_, rows.data(), b.rows, length));
+    } else if (covers_) {
+      if (!shap_) shap_ = std::make_shared<const thornvale::TreeShap>(*model_, *covers_);
+      shap = shap_;
+    } else {
+      throw std::invalid_argument(
+          "contributions need the cover of every tree node, which a model text does not hold: give background= "
+          "rows (a node's cover is then how many of them reach it), or convert the model with "
+          "Model.from_xgboost(), which keeps the trainer's covers");
+    }
+    const size_t width = shap->numContributions() + 1;
+    py::array_t<double> out({static_cast<py::ssize_t>(m.rows), static_cast<py::ssize_t>(width)});
+    double* o = out.mutable_data();
+    {
+      py::gil_scoped_release release;
+      explainDense(*shap, m, columns, missing, nthread, o);
+    }
+    return out;
+  }
+
+  // The trainer's covers, one per node of every tree in pre-order, trees in
+  // the order of the model text; None when the model has none.
+  std::optional<py::array_t<double>> covers() const {
+    if (!covers_) return std::nullopt;
+    std::vector<double> flat;
+    for (const auto& tree : *covers_) flat.insert(flat.end(), tree.begin(), tree.end());
+    return py::array_t<double>(static_cast<py::ssize_t>(flat.size()), flat.data());
+  }
+
+  // Bytes held for contributions over the trainer's covers: the covers and
+  // the explainer's tables (made here if not yet). For benchmarks.
+  size_t explainerBytes() {
+    if (!covers_) return 0;
+    if (!shap_) shap_ = std::make_shared<const thornvale::TreeShap>(*model_, *covers_);
+    size_t bytes = shap_->tableBytes();
+    for (const auto& tree : *covers_) bytes += tree.capacity() * sizeof(double);
+    return bytes;
+  }
+
+  void setCovers(const py::array_t<double, py::array::c_style | py::array::forcecast>& flat) {
+    if (flat.ndim() != 1) throw std::invalid_argument("covers must be a 1-D array");
+    const auto& trees = model_->getForest().trees;
+    thornvale::TreeCovers covers(trees.size());
+    size_t at = 0;
+    const auto total = static_cast<size_t>(flat.shape(0));
+    for (size_t t = 0; t < trees.size(); ++t) {
+      const size_t n = trees[t].tree ? nodeCount(trees[t].tree->root.get()) : 0;
+      if (total - at < n) {
+        throw std::invalid_argument("covers has " + std::to_string(total) + " entries, too few for the model's " +
+                                    "trees");
+      }
+      covers[t].assign(flat.data() + at, flat.data() + at + n);
+      at += n;
+    }
+    if (at != total) {
+      throw std::invalid_argument("covers has " + std::to_string(total) + " entries but the model's trees have " +
+                                  std::to_string(at) + " nodes");
+    }
+    shap_ = std::make_shared<const thornvale::TreeShap>(*model_, covers);  // checks them
+    covers_ = std::move(covers);
   }
 
   py::array_t<double> predictRows(const py::iterable& rows, std::optional<double> missing, bool outputMargin) const {
@@ -223,8 +283,69 @@ class Model {
   }
 
  private:
+  // `x` as a Matrix, without a copy; `what` names it in messages.
+  static Matrix matrixOf(const py::array& x, const std::string& what) {
+    if (x.ndim() != 2) {
+      throw std::invalid_argument(what + " must be a 2-D array, got " + std::to_string(x.ndim()) + " dimensions");
+    }
+    Matrix m;
+    if (x.dtype().is(py::dtype::of<double>())) {
+      m.isDouble = true;
+    } else if (!x.dtype().is(py::dtype::of<float>())) {
+      throw std::invalid_argument(what + " must hold float32 or float64 values, got " +
+                                  py::str(x.dtype()).cast<std::string>());
+    }
+    m.data = static_cast<const char*>(x.data());
+    m.rows = static_cast<size_t>(x.shape(0));
+    m.cols = static_cast<size_t>(x.shape(1));
+    m.rowStride = x.strides(0);
+    m.colStride = x.strides(1);
+    return m;
+  }
+
+  // The column of `m` that feeds each position of the feature vector.
+  std::vector<int64_t> columnsOf(const Matrix& m, const std::optional<std::vector<int32_t>>& columnIds,
+                                 const std::string& what) const {
+    if (columnIds) {
+      if (columnIds->size() != m.cols) {
+        throw std::invalid_argument(what + " has " + std::to_string(m.cols) + " columns but feature_ids names " +
+                                    std::to_string(columnIds->size()));
+      }
+      return columnsForModel(*model_, *columnIds);
+    }
+    const auto& mapping = model_->getForest().featureMapping;
+    if (mapping.size() != m.cols) {
+      throw std::invalid_argument(what + " has " + std::to_string(m.cols) + " columns but the model reads " +
+                                  std::to_string(mapping.size()) + " features; give feature_ids to name the columns");
+    }
+    std::vector<int64_t> columns(mapping.size(), -1);
+    for (size_t p = 0; p < mapping.size(); ++p) {
+      if (model_->getFeatureIndex().at(mapping[p]) == p) columns[p] = static_cast<int64_t>(p);
+    }
+    return columns;
+  }
+
+  static size_t nodeCount(const thornvale::Node* root) {
+    size_t count = 0;
+    std::vector<const thornvale::Node*> pending;
+    if (root != nullptr) pending.push_back(root);
+    while (!pending.empty()) {
+      const thornvale::Node* n = pending.back();
+      pending.pop_back();
+      ++count;
+      if (n->isLeaf()) continue;
+      const auto* s = static_cast<const thornvale::LinearNode*>(n);
+      if (s->left) pending.push_back(s->left.get());
+      if (s->right) pending.push_back(s->right.get());
+    }
+    return count;
+  }
+
   std::string text_;
   std::unique_ptr<thornvale::BoostingModel> model_;
+  std::optional<thornvale::TreeCovers> covers_;
+  // Explainer over covers_, made on first use with the interpreter's lock held.
+  std::shared_ptr<const thornvale::TreeShap> shap_;
 };
 
 // The computed features of collection texts, as rows of 74 columns (ids 1 to
@@ -374,7 +495,12 @@ PYBIND11_MODULE(_native, m) {
       .def_property_readonly("base_score", &Model::baseScore)
       .def("predict", &Model::predict, py::arg("x"), py::arg("column_ids"), py::arg("missing"),
            py::arg("output_margin"), py::arg("nthread"))
-      .def("predict_rows", &Model::predictRows, py::arg("rows"), py::arg("missing"), py::arg("output_margin"));
+      .def("predict_rows", &Model::predictRows, py::arg("rows"), py::arg("missing"), py::arg("output_margin"))
+      .def("contributions", &Model::contributions, py::arg("x"), py::arg("column_ids"), py::arg("background"),
+           py::arg("background_ids"), py::arg("missing"), py::arg("nthread"))
+      .def_property_readonly("covers", &Model::covers)
+      .def("set_covers", &Model::setCovers, py::arg("covers"))
+      .def("explainer_bytes", &Model::explainerBytes);
 
   m.def("extract_features", &extractFeatures, py::arg("texts"), py::arg("name"), py::arg("first_lines"));
   m.attr("FEATURE_COUNT") = kFeatureCount;
