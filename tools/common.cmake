@@ -2,7 +2,8 @@
 #
 # reliqa_readers:          JSON readers (collections, feature rows, server-feature
 #                          texts) with messages that name file, line and member.
-# reliqa_xgboost:          reading XGBoost JSON models and converting them.
+# reliqa_xgboost:          reading XGBoost JSON models, converting them, and
+#                          taking node covers from them.
 # reliqa_classifier_store: a classifier over the SQLite store at a path.
 set(_common_dir ${CMAKE_CURRENT_SOURCE_DIR}/common)
 
@@ -18,10 +19,12 @@ reliqa_test(reliqa_readers_test
   SOURCES ${_common_dir}/collection_reader_test.cc ${_common_dir}/feature_rows_test.cc
   LIBS reliqa_readers)
 
-add_library(reliqa_xgboost STATIC ${_common_dir}/xgboost_model.cc)
+add_library(reliqa_xgboost STATIC ${_common_dir}/xgboost_model.cc ${_common_dir}/xgboost_covers.cc)
 target_link_libraries(reliqa_xgboost PUBLIC reliqa_readers gbdt)
 
-reliqa_test(reliqa_xgboost_test SOURCES ${_common_dir}/xgboost_model_test.cc LIBS reliqa_xgboost)
+reliqa_test(reliqa_xgboost_test
+  SOURCES ${_common_dir}/xgboost_model_test.cc ${_common_dir}/xgboost_covers_test.cc
+  LIBS reliqa_xgboost)
 
 add_library(reliqa_classifier_store STATIC ${_common_dir}/classifier_store.cc)
 target_link_libraries(reliqa_classifier_store PUBLIC reliqa_classifier keystash gbdt)

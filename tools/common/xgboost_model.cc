@@ -16,6 +16,7 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/ModelWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/serialize.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
 namespace reliqa::tool {
 
@@ -138,6 +139,18 @@ std::vector<float> readFloats(JsonDoc& doc, value& v, const std::string& path) {
   return out;
 }
 
+// Hessian sums are weights: finite (readFloat refuses what a float cannot
+// hold) and not negative.
+std::vector<float> readHessians(JsonDoc& doc, value& v, const std::string& path) {
+  std::vector<float> out;
+  forEachElement(doc, doc.getArray(v, path), path, [&](size_t, const std::string& p, value& x) {
+    const float h = readFloat(doc, x, p);
+    if (h < 0.0f) doc.fail(x, p + ": " + thornvale::doubleToText(h) + " is negative; a hessian sum cannot be");
+    out.push_back(h);
+  });
+  return out;
+}
+
 XgbTree readTree(JsonDoc& doc, value& v, const std::string& path) {
   XgbTree tree;
   tree.line = doc.lineOf(v);
@@ -151,6 +164,7 @@ XgbTree readTree(JsonDoc& doc, value& v, const std::string& path) {
     else if (key == "split_indices") tree.splitIndex = readInts(doc, x, p);
     else if (key == "split_conditions") tree.splitCondition = readFloats(doc, x, p);
     else if (key == "split_type") tree.splitType = readInts(doc, x, p);
+    else if (key == "sum_hessian") tree.sumHessian = readHessians(doc, x, p);
     else if (key == "categories_nodes") categorical = !readInts(doc, x, p).empty() || categorical;
     else if (key == "tree_param") {
       forEachMember(doc, doc.getObject(x, p), p, [&](std::string_view k, const std::string& q, value& y) {
@@ -181,6 +195,7 @@ XgbTree readTree(JsonDoc& doc, value& v, const std::string& path) {
   sameSize(tree.splitIndex.size(), "split_indices");
   sameSize(tree.splitCondition.size(), "split_conditions");
   if (!tree.splitType.empty()) sameSize(tree.splitType.size(), "split_type");
+  if (!tree.sumHessian.empty()) sameSize(tree.sumHessian.size(), "sum_hessian");
   return tree;
 }
 

@@ -6,7 +6,9 @@
 // objective, one output (no multi-class, no vector leaves), numerical splits
 // only, and well-formed trees (child indices in range, every node reached once,
 // split features below num_feature, finite values). Anything else is refused
-// with a ToolError that says what and where.
+// with a ToolError that says what and where. A tree's sum_hessian (the
+// training weight that reached each node) is optional; when present it must
+// have one finite, non-negative entry per node.
 //
 // toForest maps an XgbModel onto our Forest: one tree of weight 1 per XGBoost
 // tree, the base score as the logit of XGBoost's base_score, and XGBoost's
@@ -37,6 +39,7 @@ struct XgbTree {
   std::vector<int32_t> splitIndex;      // feature of a split
   std::vector<float> splitCondition;    // threshold of a split; value of a leaf
   std::vector<int32_t> splitType;       // 0 numerical, 1 categorical (may be empty)
+  std::vector<float> sumHessian;        // cover of each node, finite and >= 0 (may be empty)
   int64_t line = 0;                     // where the tree starts, for messages
 };
 
