@@ -372,9 +372,21 @@ class Explain(Tool):
         for e in from_stdin:
             self.assertAddsUp(e)
 
+    def test_a_background_makes_the_bias_its_mean_raw_score(self):
+        # With covers counted over rows, each tree's expectation is its mean
+        # over them; counting goes a block of rows at a time, so cross one.
+        rng = random.Random(11)
+        rows = "".join(json.dumps({str(i): rng.choice([0, 1, 5, 40, 1e4]) * rng.random() for i in range(1, 75)}) + "\n"
+                       for _ in range(1100))
+        background = self.path("big.jsonl", rows)
+        raw = [float(t) for t in self.ok("score", "--raw", "--model", self.model, background).split()]
+        e = self.explain("--rows", "-", covers=["--background", background], stdin=self.features)[0]
+        self.assertAlmostEqual(e["bias"], sum(raw) / len(raw), places=9)
+
     def test_covers_are_required_and_must_fit(self):
         c = self.example
-        self.refused("explain", "--model", self.model, c, pattern=r"covers are needed and never guessed: give --xgboost")
+        self.refused("explain", "--model", self.model, c,
+                     pattern=r"covers are needed and never guessed: give --xgboost")
         self.refused("explain", "--model", self.model, "--xgboost", self.xgboost, "--background", self.background, c,
                      pattern=r"--xgboost and --background both give the covers; give one")
         self.refused("explain", "--model", self.model, "--xgboost", self.xgboost,

@@ -134,7 +134,8 @@ Handler defineExplain(CLI::App& cmd) {
   auto* background = cmd.add_option("--background", h->background,
                                     "covers counted over these feature rows (JSON Lines, - for standard input)");
   auto* input = cmd.add_option("FILE", h->input, "collection JSON file, or - for JSON Lines on standard input");
-  auto* rows = cmd.add_option("--rows", h->rows, "explain these feature rows instead (JSON Lines, - for standard input)");
+  auto* rows =
+      cmd.add_option("--rows", h->rows, "explain these feature rows instead (JSON Lines, - for standard input)");
   auto* svg = cmd.add_option("--svg", h->svg, "also draw the one input as an SVG waterfall chart into this file");
   return [h, xgboost, background, input, rows, svg](Context& c) {
     if (*xgboost) h->o.xgboost = h->xgboost;
