@@ -1,12 +1,13 @@
 # The `reliqa` command-line tool (build/bin/reliqa) and its tests.
 #
-# reliqa_tool_models: model inspection, partial dependence and their charts
-#                     (needs the engine).
+# reliqa_tool_models: model inspection, partial dependence, explanations and
+#                     their charts (needs the engine).
 # reliqa:             the tool.
 set(_reliqa_dir ${CMAKE_CURRENT_SOURCE_DIR}/reliqa)
 
 add_library(reliqa_tool_models STATIC
   ${_reliqa_dir}/chart.cc
+  ${_reliqa_dir}/explain.cc
   ${_reliqa_dir}/inspect.cc
   ${_reliqa_dir}/io.cc
   ${_reliqa_dir}/pdp.cc

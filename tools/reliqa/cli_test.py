@@ -9,12 +9,14 @@ machine; every run of the tool then goes through it.
 Covers the error paths (one test per kind of bad input: exit status 2, one
 "reliqa: FILE:LINE: ..." line, nothing on standard output, nothing stored),
 JSON Lines streaming, the guard that keeps a rejected model out of the store,
-and the default store location.
+the default store location, and the explanations of scores (sums, refusals,
+the waterfall chart).
 """
 
 import base64
 import json
 import os
+import random
 import re
 import select
 import shutil
@@ -24,6 +26,7 @@ import subprocess
 import sys
 import tempfile
 import unittest
+import xml.etree.ElementTree as ET
 
 RELIQA = None  # the command that runs the tool: [emulator] + [path]
 ROOT = None
@@ -101,7 +104,7 @@ class Tool(unittest.TestCase):
 
 class UsageErrors(Tool):
     def test_help_exits_zero_on_every_subcommand(self):
-        for cmd in ([], ["set-model"], ["classify"], ["score"], ["pdp"], ["convert", "xgboost"]):
+        for cmd in ([], ["set-model"], ["classify"], ["score"], ["explain"], ["pdp"], ["convert", "xgboost"]):
             r = self.run_tool(*cmd, "--help")
             self.assertEqual(r.returncode, 0)
             self.assertIn("Usage:", r.stdout)
@@ -318,6 +321,128 @@ class Inspection(Tool):
         self.assertEqual(len(csv.splitlines()), 61)
         with open(svg) as f:
             self.assertIn("<polyline", f.read())
+
+
+class Explain(Tool):
+    """`explain` on the example model: sums that reach the scores of `score`, and its refusals."""
+
+    def setUp(self):
+        super().setUp()
+        self.model = os.path.join(ROOT, "examples", "model.txt")
+        self.xgboost = os.path.join(ROOT, "examples", "model.json")
+        self.example = os.path.join(ROOT, "examples", "collection.json")
+        self.features = self.ok("features", self.example)
+        # Background: the example's features, each scaled at random.
+        rng = random.Random(7)
+        example = json.loads(self.features)
+        self.background = self.path("bg.jsonl", "".join(
+            json.dumps({k: v * rng.uniform(0, 2) for k, v in example.items()}) + "\n" for _ in range(60)))
+
+    def explain(self, *args, covers=None, **kw):
+        covers = covers or ["--background", self.background]
+        return [json.loads(l) for l in self.ok("explain", "--model", self.model, *covers, *args, **kw).splitlines()]
+
+    def assertAddsUp(self, e):
+        contributions = e["contributions"].values()
+        total = e["bias"] + sum(contributions)
+        self.assertLessEqual(abs(total - e["raw_score"]), 1e-9 * max(sum(abs(c) for c in contributions), 1e-300))
+
+    def test_collections_and_rows_are_explained_up_to_the_scores_of_score(self):
+        rows = self.path("rows.jsonl", self.features + json.dumps({"4": 30, "7": -1}) + "\n")
+        raw = [float(t) for t in self.ok("score", "--raw", "--model", self.model, rows).split()]
+        scores = [float(t) for t in self.ok("score", "--model", self.model, rows).split()]
+        from_file = self.explain(self.example)
+        with open(self.example) as f:
+            example = json.load(f)
+        from_stdin = self.explain("-", stdin=json.dumps(collection(3)) + "\n\n" + json.dumps(example) + "\n")
+        from_rows = self.explain("--rows", rows)
+        with_xgboost = self.explain("--rows", "-", covers=["--xgboost", self.xgboost],
+                                    stdin=self.features + '{"4":30,"7":-1}')
+        self.assertEqual((len(from_file), len(from_stdin), len(from_rows), len(with_xgboost)), (1, 2, 2, 2))
+        # The collection's computed features, as features prints them, are the row.
+        self.assertEqual(from_file[0], from_stdin[1])
+        self.assertEqual(from_file[0], from_rows[0])
+        for e in from_rows + with_xgboost:
+            self.assertEqual(list(e), ["bias", "contributions", "raw_score", "score"])
+            self.assertEqual(list(e["contributions"]), [str(i) for i in range(1, 75)])
+            self.assertAddsUp(e)
+        self.assertEqual([e["raw_score"] for e in from_rows], raw)
+        self.assertEqual([e["score"] for e in with_xgboost], scores)
+        self.assertNotEqual(from_rows[1]["bias"], with_xgboost[1]["bias"])  # the covers differ
+        for e in from_stdin:
+            self.assertAddsUp(e)
+
+    def test_a_background_makes_the_bias_its_mean_raw_score(self):
+        # With covers counted over rows, each tree's expectation is its mean
+        # over them; counting goes a block of rows at a time, so cross one.
+        rng = random.Random(11)
+        rows = "".join(json.dumps({str(i): rng.choice([0, 1, 5, 40, 1e4]) * rng.random() for i in range(1, 75)}) + "\n"
+                       for _ in range(1100))
+        background = self.path("big.jsonl", rows)
+        raw = [float(t) for t in self.ok("score", "--raw", "--model", self.model, background).split()]
+        e = self.explain("--rows", "-", covers=["--background", background], stdin=self.features)[0]
+        self.assertAlmostEqual(e["bias"], sum(raw) / len(raw), places=9)
+
+    def test_covers_are_required_and_must_fit(self):
+        c = self.example
+        self.refused("explain", "--model", self.model, c,
+                     pattern=r"covers are needed and never guessed: give --xgboost")
+        self.refused("explain", "--model", self.model, "--xgboost", self.xgboost, "--background", self.background, c,
+                     pattern=r"--xgboost and --background both give the covers; give one")
+        self.refused("explain", "--model", self.model, "--xgboost", self.xgboost,
+                     pattern=r"give a collection \(FILE, or - for JSON Lines\) or --rows FILE")
+        self.refused("explain", "--model", self.model, "--background", "-", "-", pattern=r"only one input can come")
+        with open(self.xgboost) as f:
+            xgboost = json.load(f)
+        booster = xgboost["learner"]["gradient_booster"]["model"]
+        tree = booster["trees"][3]
+        tree["split_conditions"][0] = float(tree["split_conditions"][0]) + 0.5
+        self.refused("explain", "--model", self.model, "--xgboost", self.path("moved.json", json.dumps(xgboost)), c,
+                     pattern=r"moved\.json:\d+: tree 3, node 0 \(node 0 .*\): the model tests x <= .*, XGBoost x < ")
+        del booster["trees"][-1], booster["tree_info"][-1]
+        booster["gbtree_model_param"]["num_trees"] = "119"
+        self.refused("explain", "--model", self.model, "--xgboost", self.path("short.json", json.dumps(xgboost)), c,
+                     pattern=r"short\.json: the XGBoost model has 119 trees but the model 120")
+        bad = self.path("bad.jsonl", '{"1": 2}\n\n{"1": "x"}\n')
+        self.refused("explain", "--model", self.model, "--background", bad, c,
+                     pattern=re.escape(bad) + r":3: feature 1: expected a number, got a string")
+        self.refused("explain", "--model", self.model, "--background", self.path("empty.jsonl", "\n"), c,
+                     pattern=r"empty\.jsonl: the background has no rows")
+
+    def test_waterfall_chart_of_one_input(self):
+        svg = self.path("why.svg")
+        e = self.explain(self.example, "--svg", svg)[0]
+        texts = ["".join(t.itertext()) for t in ET.parse(svg).getroot().iter("{http://www.w3.org/2000/svg}text")]
+        self.assertIn("bias", texts)
+        self.assertIn("raw score", texts)
+        self.assertIn("%.4g" % e["bias"], texts)
+        self.assertIn("%.4g\u2192 score %.4g" % (e["raw_score"], e["score"]), texts)
+        self.assertEqual(sum(t.startswith("feature ") for t in texts), 12)
+        self.assertIn("62 other features", texts)
+        # One chart draws one input: a second is refused after the first answer, and nothing is drawn.
+        os.remove(svg)
+        r = self.run_tool("explain", "--model", self.model, "--background", self.background, "--rows", "-",
+                          "--svg", svg, stdin=self.features + "\n" + self.features)
+        self.assertEqual((r.returncode, len(r.stdout.splitlines())), (2, 1))
+        self.assertRegex(r.stderr, r"reliqa: <stdin>:3: --svg draws one input, and this is a second one")
+        self.assertFalse(os.path.exists(svg))
+
+    def test_a_converted_model_is_labelled_with_its_feature_names(self):
+        tree = {"left_children": [1, -1, -1], "right_children": [2, -1, -1], "split_indices": [1, 0, 0],
+                "split_conditions": [0.5, -0.25, 0.75], "sum_hessian": [10, 3, 7], "tree_param": {"num_nodes": "3"}}
+        m = {"learner": {"feature_names": ["age", "size & <weight>"], "objective": {"name": "binary:logistic"},
+                         "learner_model_param": {"base_score": "5E-1", "num_feature": "2"},
+                         "gradient_booster": {"name": "gbtree", "model": {"trees": [tree]}}}}
+        x, txt, svg = self.path("x.json", m), self.path("x.txt"), self.path("x.svg")
+        self.ok("convert", "xgboost", "--feature-ids", "5,-9", x, "-o", txt)
+        out = self.ok("explain", "--model", txt, "--xgboost", x, "--rows", "-", "--svg", svg, stdin='{"-9": 0.25}')
+        # Covers 3 and 7 of 10: the left leaf differs from the mean 0.45 by -0.7.
+        e = json.loads(out)
+        self.assertEqual((list(e["contributions"]), e["contributions"]["5"], e["raw_score"]), (["-9", "5"], 0, -0.25))
+        self.assertAlmostEqual(e["bias"], 0.45, places=14)
+        self.assertAlmostEqual(e["contributions"]["-9"], -0.7, places=14)
+        with open(svg) as f:
+            self.assertIn("feature -9 (size &amp; &lt;weight&gt;)", f.read())
 
 
 if __name__ == "__main__":

@@ -9,6 +9,8 @@
 #include <cstring>
 #include <iostream>
 #include <memory>
+#include <optional>
+#include <stdexcept>
 
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
@@ -16,10 +18,13 @@
 #include "tools/common/collection_reader.h"
 #include "tools/common/errors.h"
 #include "tools/common/feature_rows.h"
+#include "tools/common/xgboost_covers.h"
 #include "tools/common/xgboost_model.h"
+#include "tools/reliqa/explain.h"
 #include "tools/reliqa/inspect.h"
 #include "tools/reliqa/pdp.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
+#include "xplat/gbdtclassifier/GbdtClassifier/JsonError.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/JsonWriter.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
@@ -59,6 +64,26 @@ void forEachCollection(const std::string& input, ResultWriter& out, F&& onCollec
     reader.read(text, name, line, collection);
     onCollection(collection, name, line);
   });
+}
+
+// Calls `onRow(row, name, line)` for every non-blank line of a JSON Lines
+// file of feature rows ("-" for standard input).
+template <class F>
+void forEachRow(const std::string& rows, ResultWriter& out, F&& onRow) {
+  LineReader lines(rows, &out);
+  std::string line;
+  while (lines.next(line)) {
+    if (line.find_first_not_of(" \t") == std::string::npos) continue;
+    onRow(parseFeatureRow(line, lines.name(), lines.lineNumber()), lines.name(), lines.lineNumber());
+  }
+}
+
+// Binary XGBoost models are told apart by their file name.
+void refuseBinaryXgboost(const std::string& path) {
+  if (path.size() > 4 && path.compare(path.size() - 4, 4, ".ubj") == 0) {
+    throw ToolError(displayName(path), 0,
+                    "binary (UBJSON) models cannot be read; save the model as JSON: save_model(\"model.json\")");
+  }
 }
 
 // {"score":S,"isOverThreshold":B,"loggingData":{...}} into `s`.
@@ -145,12 +170,83 @@ void features(const std::string& input, ResultWriter& out) {
 void score(const std::string& modelPath, const std::string& rows, bool raw, ResultWriter& out) {
   if (modelPath == "-" && rows == "-") throw UsageError("the model and the rows cannot both come from standard input");
   auto model = loadModel(displayName(modelPath), readFile(modelPath));
-  LineReader lines(rows, &out);
-  std::string line;
-  while (lines.next(line)) {
-    if (line.find_first_not_of(" \t") == std::string::npos) continue;
-    thornvale::FeatureMap row = parseFeatureRow(line, lines.name(), lines.lineNumber());
+  forEachRow(rows, out, [&](const thornvale::FeatureMap& row, const std::string&, int64_t) {
     out.line(thornvale::doubleToText(raw ? model->rawScore(row) : model->predict(row)));
+  });
+}
+
+void explain(const ExplainOptions& o, ResultWriter& out) {
+  if (!o.xgboost && !o.background) {
+    throw UsageError("node covers are needed and never guessed: give --xgboost MODEL.json (the XGBoost model that "
+                     "the model was converted from) or --background ROWS.jsonl (feature rows to count them over)");
+  }
+  if (o.xgboost && o.background) throw UsageError("--xgboost and --background both give the covers; give one");
+  if (!o.input && !o.rows) throw UsageError("give a collection (FILE, or - for JSON Lines) or --rows FILE");
+  if (o.input && o.rows) throw UsageError("give a collection or --rows, not both");
+  int fromStdin = 0;
+  for (const auto* path : {&o.xgboost, &o.background, &o.input, &o.rows}) fromStdin += *path == "-";
+  if (fromStdin + (o.model == "-") > 1) throw UsageError("only one input can come from standard input");
+
+  const std::string modelName = displayName(o.model);
+  auto model = loadModel(modelName, readFile(o.model));
+  thornvale::TreeCovers covers;
+  std::string coversName;
+  if (o.xgboost) {
+    coversName = displayName(*o.xgboost);
+    refuseBinaryXgboost(*o.xgboost);
+    covers = xgboostCovers(readXgboostModel(readFile(*o.xgboost), coversName), *model, coversName);
+  } else {
+    coversName = displayName(*o.background);
+    CoverCounter counter(*model);
+    forEachRow(*o.background, out, [&](const thornvale::FeatureMap& row, const std::string&, int64_t) {
+      counter.add(row);
+    });
+    if (counter.rows() == 0) throw ToolError(coversName, 0, "the background has no rows to count covers over");
+    covers = counter.covers();
+  }
+  std::optional<ScoreExplainer> explainer;
+  try {
+    explainer.emplace(*model, covers);
+  } catch (const std::invalid_argument& e) {
+    throw ToolError(coversName, 0, std::string("the covers cannot be used: ") + e.what());
+  }
+
+  // With --svg the one input is drawn once the input has ended: a second
+  // input is refused and no chart is written.
+  int64_t inputs = 0;
+  std::string svg;
+  auto onInput = [&](const thornvale::FeatureMap& features, const std::string& name, int64_t line) {
+    if (o.svg && ++inputs > 1) {
+      throw ToolError(name, line, "--svg draws one input, and this is a second one; give one collection or row");
+    }
+    const Explanation e = explainer->explain(features);
+    try {
+      out.line(explainer->json(e));
+      if (o.svg) {
+        const std::string where = name + (o.rows || *o.input == "-" ? ":" + std::to_string(line) : "");
+        svg = explainer->waterfallSvg(e, "Contributions to the raw score of " + where + " (" + modelName + ")");
+      }
+    } catch (const thornvale::JsonPrintError& error) {
+      throw ToolError(name, line, std::string("the explanation cannot be written: ") + error.what());
+    }
+  };
+  if (o.rows) {
+    forEachRow(*o.rows, out, onInput);
+  } else {
+    forEachCollection(*o.input, out, [&](const rc::ReliqaClassifierInput& collection, const std::string& name,
+                                         int64_t line) {
+      thornvale::FeatureMap features;
+      try {
+        features = rc::extractFeatures(collection);
+      } catch (const std::exception& e) {
+        throw ToolError(name, line, std::string("feature extraction failed: ") + e.what());
+      }
+      onInput(features, name, line);
+    });
+  }
+  if (o.svg) {
+    if (inputs == 0) throw ToolError(displayName(o.rows ? *o.rows : *o.input), 0, "--svg: there is no input to draw");
+    writeFileAtomically(*o.svg, svg);
   }
 }
 
@@ -188,9 +284,7 @@ void pdp(const PdpOptions& o, ResultWriter& out) {
 void convertXgboost(const ConvertOptions& o, ResultWriter& out, bool verbose) {
   const std::string name = displayName(o.input);
   const std::vector<int64_t> given = parseIdList(o.featureIds);
-  if (o.input.size() > 4 && o.input.compare(o.input.size() - 4, 4, ".ubj") == 0) {
-    throw ToolError(name, 0, "binary (UBJSON) models cannot be read; save the model as JSON: save_model(\"model.json\")");
-  }
+  refuseBinaryXgboost(o.input);
   const ConvertedModel converted = convertXgboostJson(readFile(o.input), name, given, "--feature-ids 1,2,...");
   if (o.output == "-") {
     out.write(converted.text);

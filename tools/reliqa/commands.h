@@ -37,6 +37,18 @@ void features(const std::string& input, ResultWriter& out);
 
 void score(const std::string& model, const std::string& rows, bool raw, ResultWriter& out);
 
+// Exactly one covers source and exactly one input; at most one of the files
+// may be "-" (standard input).
+struct ExplainOptions {
+  std::string model;
+  std::optional<std::string> xgboost;     // the XGBoost JSON model it was converted from
+  std::optional<std::string> background;  // feature rows, JSON Lines
+  std::optional<std::string> input;       // a collection file, or "-" for JSON Lines
+  std::optional<std::string> rows;        // feature rows, JSON Lines
+  std::optional<std::string> svg;
+};
+void explain(const ExplainOptions& o, ResultWriter& out);
+
 struct InspectOptions {
   std::string model;
   std::optional<int64_t> tree;

@@ -9,6 +9,14 @@ converts each with `reliqa convert xgboost`, scores a few thousand rows through
 `reliqa score` and through XGBoost, and requires the same verdict at 0.5 and
 probabilities within 1e-6. The rows include values exactly on split values and
 the float just below them, where a strict and a non-strict comparison differ.
+
+It also explains a few hundred of those rows with `reliqa explain --rows`, its
+covers taken from the XGBoost model (--xgboost), and requires every
+contribution and the bias to be within 1e-5 of XGBoost's
+predict(pred_contribs=True), and each explanation's raw score to be what
+`reliqa score --raw` printed. Feature rows are JSON, which has no NaN, so rows
+with missing values cannot reach the tool; they are not explained here.
+
 Needs Debian's python3-xgboost and python3-numpy (/usr/bin/python3).
 """
 
@@ -32,6 +40,8 @@ MODELS = [
 ]
 RANDOM_ROWS = 1500
 BOUNDARY_VALUES = 700  # split values tested on and just below
+EXPLAINED_ROWS = 200   # random rows explained, and as many on or below split values
+CONTRIBUTION_TOLERANCE = 1e-5
 
 
 def make_data(rng, n, f):
@@ -134,6 +144,36 @@ def check_model(reliqa, work, rng, config):
     if worst > 1e-6:
         i = int(np.argmax(np.abs(ours - theirs)))
         problems.append(f"{name}: row {i}: score {ours[i]!r} vs XGBoost {theirs[i]!r}")
+    problems += check_contributions(reliqa, name, booster, model_json, model_txt, ids, names, rows, lines, our_margin)
+    return problems
+
+
+def check_contributions(reliqa, name, booster, model_json, model_txt, ids, names, rows, lines, our_margin):
+    """Our explanations of some of the rows against XGBoost's pred_contribs."""
+    picked = np.concatenate([np.arange(EXPLAINED_ROWS),
+                             RANDOM_ROWS + np.arange(min(EXPLAINED_ROWS, len(rows) - RANDOM_ROWS))])
+    all_lines = lines.splitlines(keepends=True)
+    out = subprocess.run([reliqa, "explain", "--model", model_txt, "--xgboost", model_json, "--rows", "-"],
+                         input="".join(all_lines[i] for i in picked).encode(), stdout=subprocess.PIPE,
+                         stderr=subprocess.DEVNULL, check=True).stdout.decode().splitlines()
+    if len(out) != len(picked):
+        return [f"{name}: {len(out)} explanations for {len(picked)} rows"]
+    explained = [json.loads(line) for line in out]
+    # Ours in XGBoost's column order: one column per feature, then the bias.
+    ours = np.array([[e["contributions"][str(i)] for i in ids] + [e["bias"]] for e in explained])
+    theirs = booster.predict(xgb.DMatrix(rows[picked], feature_names=names), pred_contribs=True).astype(np.float64)
+    diff = np.abs(ours - theirs)
+    worst_row, worst_column = np.unravel_index(int(np.argmax(diff)), diff.shape)
+    raw_mismatches = sum(e["raw_score"] != our_margin[i] for e, i in zip(explained, picked))
+    print(f"crosscheck: {name}: contributions of {len(picked)} rows: max |diff| {diff.max():.2e} "
+          f"(bias {diff[:, -1].max():.2e}), raw scores unlike score's {raw_mismatches}")
+    problems = []
+    if diff.max() > CONTRIBUTION_TOLERANCE:
+        what = "bias" if worst_column == len(ids) else f"feature {ids[worst_column]}"
+        problems.append(f"{name}: row {picked[worst_row]}: {what}: {ours[worst_row, worst_column]!r} vs "
+                        f"XGBoost {theirs[worst_row, worst_column]!r}")
+    if raw_mismatches:
+        problems.append(f"{name}: {raw_mismatches} explanations give another raw score than score --raw")
     return problems
 
 

@@ -68,6 +68,19 @@ TEST(Chart, SvgHasTitleAxesAndCurve) {
   EXPECT_THAT(niceTicks(0.0, 1.0, 5), ElementsAre(0.0, 0.2, 0.4, 0.6000000000000001, 0.8, 1.0));
 }
 
+TEST(Chart, TextIsEscapedAndKeptToCharactersThatXmlHolds) {
+  // Input keys are bytes: markup, control characters and malformed UTF-8
+  // (a lone continuation byte, an overlong '/', a surrogate, a cut sequence)
+  // must not break the document; well-formed characters stay.
+  WaterfallChart c;
+  c.title = "a<b>&\"c\x01\x80\xC0\xAF\xED\xA0\x80 \xC3\xA9\xF0\x9F\x99\x82 \xE2\x86";
+  c.endNote = "score 1";
+  const std::string replacement = "\xEF\xBF\xBD";
+  EXPECT_THAT(renderSvg(c), HasSubstr(">a&lt;b&gt;&amp;&quot;c" + replacement + replacement + replacement + replacement +
+                                      replacement + replacement + replacement + " \xC3\xA9\xF0\x9F\x99\x82 " +
+                                      replacement + replacement + "</text>"));
+}
+
 TEST(Inspect, SummaryCountsTreesAndNamesTheForestWidth) {
   Forest f = twoInputForest();
   std::string text = thornvale::writeModel(f, 4);

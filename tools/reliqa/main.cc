@@ -1,5 +1,6 @@
 // reliqa: classify candidate collections, manage the model parameters kept in
-// the persistent store, score and inspect models, convert XGBoost models.
+// the persistent store, score, explain and inspect models, convert XGBoost
+// models.
 //
 // Exit status: 0 on success, 2 when the command line or an input is refused
 // (one line "reliqa: FILE:LINE: what is wrong" on standard error). Results are
@@ -121,6 +122,31 @@ Handler defineScore(CLI::App& cmd) {
   return [o](Context& c) { score(o->model, o->rows, o->raw, *c.out); };
 }
 
+Handler defineExplain(CLI::App& cmd) {
+  struct Options {
+    ExplainOptions o;
+    std::string xgboost, background, input, rows, svg;
+  };
+  auto h = std::make_shared<Options>();
+  cmd.add_option("--model", h->o.model, "model text")->required();
+  auto* xgboost = cmd.add_option("--xgboost", h->xgboost,
+                                 "covers from the XGBoost JSON model that the model was converted from");
+  auto* background = cmd.add_option("--background", h->background,
+                                    "covers counted over these feature rows (JSON Lines, - for standard input)");
+  auto* input = cmd.add_option("FILE", h->input, "collection JSON file, or - for JSON Lines on standard input");
+  auto* rows =
+      cmd.add_option("--rows", h->rows, "explain these feature rows instead (JSON Lines, - for standard input)");
+  auto* svg = cmd.add_option("--svg", h->svg, "also draw the one input as an SVG waterfall chart into this file");
+  return [h, xgboost, background, input, rows, svg](Context& c) {
+    if (*xgboost) h->o.xgboost = h->xgboost;
+    if (*background) h->o.background = h->background;
+    if (*input) h->o.input = h->input;
+    if (*rows) h->o.rows = h->rows;
+    if (*svg) h->o.svg = h->svg;
+    explain(h->o, *c.out);
+  };
+}
+
 Handler defineInspect(CLI::App& cmd) {
   auto o = std::make_shared<InspectOptions>();
   auto tree = std::make_shared<int64_t>(0);
@@ -201,6 +227,18 @@ const Command kCommands[] = {
      "skipped; a refused line ends the run with status 2.\nExample: reliqa "
      "score --model model.txt rows.jsonl",
      defineScore},
+    {nullptr, "explain", "Per-feature contributions to the raw score (no store)",
+     "Explain scores feature by feature, no store: for each input, one line {\"bias\":B,\"contributions\":"
+     "{\"ID\":C,...},\"raw_score\":R,\"score\":S} with every feature id of the model, where B plus the "
+     "contributions is R (up to rounding) and R and S are what score prints. The contributions are exact "
+     "Shapley values of the trees (tree SHAP), which need each node's cover: from --xgboost, the XGBoost model "
+     "the model was converted from (refused unless the trees match node for node), or from --background, "
+     "feature rows whose count at each node is its cover. One of them is required. The input is a collection "
+     "(its computed features only, no server features; - reads JSON Lines as classify does) or, with --rows, "
+     "feature rows as score reads them, such as a logged feature_vector. --svg draws a waterfall chart of one "
+     "input (a second input is refused and no chart is written).\nExample: reliqa explain --model model.txt "
+     "--xgboost model.json collection.json --svg why.svg",
+     defineExplain},
     {nullptr, "inspect", "Summarise or print a model",
      "Summarise a model text: format version, trees kept and dropped, depths and leaves, base score, input keys, "
      "feature mapping, equality features, selector and sub-models, 16- or 32-bit compiled forest.\nExample: "
