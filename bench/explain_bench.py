@@ -13,9 +13,17 @@ both are compared (within 1e-5). Then the memory that the covers and the
 explainer's tables take (as the explainer counts it), beside the memory of the
 loaded model (resident-set growth of loading its text in a fresh process). Prints tables headed by the CPU flags; timings are the best of
 --repeat runs, wall time.
+
+With --check it only compares, on more rows and on rows with NaN, and exits
+non-zero on a difference (the test command runs it; it trains the models
+first when DIR lacks them, with --reliqa's conversion). NaN goes the way of
+each split's learned default in XGBoost and the way of our NaN rule in
+reliqa (right at the root, left below it), so rows with NaN are compared
+with a copy of the XGBoost model whose default directions are ours.
 """
 
 import argparse
+import json
 import os
 import subprocess
 import sys
@@ -69,13 +77,54 @@ print(rss() - start)
 """
 
 
+def check(args):
+    if not all(os.path.exists(os.path.join(args.models, n + ".json")) for n in MODELS):
+        trainer = os.path.join(os.path.dirname(os.path.abspath(__file__)), "xgboost_models.py")
+        subprocess.run([sys.executable, trainer, args.reliqa, args.models], check=True)
+    rng = np.random.default_rng(5)
+    for name in MODELS:
+        path = os.path.join(args.models, name + ".json")
+        booster = xgb.Booster(model_file=path)
+        model = reliqa.Model.from_xgboost(booster)
+        n = 60 if name == "m2000_d8" else 300
+        X = rng.normal(size=(n, 74)).astype(np.float32)
+        names = booster.feature_names
+        worst = float(np.max(np.abs(booster.predict(xgb.DMatrix(X, feature_names=names), pred_contribs=True)
+                                    - model.contributions(X))))
+        with open(path) as f:
+            doc = json.load(f)
+        trees = doc["learner"]["gradient_booster"]["model"]["trees"]
+        splits = differ = 0
+        for t in trees:
+            ours = [0] + [1] * (len(t["default_left"]) - 1)
+            for node, (d, o) in enumerate(zip(t["default_left"], ours)):
+                if t["left_children"][node] != -1:
+                    splits += 1
+                    differ += int(d) != o
+            t["default_left"] = ours
+        aligned = xgb.Booster()
+        aligned.load_model(bytearray(json.dumps(doc).encode()))
+        X[rng.random(X.shape) < 0.2] = np.nan
+        theirs = aligned.predict(xgb.DMatrix(X, feature_names=names), pred_contribs=True)
+        worst_nan = float(np.max(np.abs(theirs - model.contributions(X, missing=None))))
+        print(f"{name}: largest difference {worst:.2g} on {n} rows, {worst_nan:.2g} on {n} rows with NaN; "
+              f"XGBoost's default direction differs from our NaN rule at {differ} of {splits} splits")
+        if not (worst <= 1e-5 and worst_nan <= 1e-5):
+            sys.exit(f"{name}: contributions differ from XGBoost's by more than 1e-5")
+
+
 def main():
     parser = argparse.ArgumentParser(description=__doc__, formatter_class=argparse.RawDescriptionHelpFormatter)
     parser.add_argument("--models", default="build/xgboost-bench-models")
     parser.add_argument("--rows", type=int, default=2000)
     parser.add_argument("--xgboost-rows", type=int, default=200)
     parser.add_argument("--repeat", type=int, default=3)
+    parser.add_argument("--check", action="store_true", help="compare only (see above)")
+    parser.add_argument("--reliqa", default="build/bin/reliqa", help="the tool, to convert models with --check")
     args = parser.parse_args()
+    if args.check:
+        check(args)
+        return
 
     rng = np.random.default_rng(11)
     X = rng.normal(size=(args.rows, 74)).astype(np.float32)

@@ -26,3 +26,14 @@ add_executable(xgboost_bench ${CMAKE_CURRENT_LIST_DIR}/xgboost_bench.cc)
 target_include_directories(xgboost_bench PRIVATE ${RELIQA_XGBOOST_INCLUDE})
 target_link_libraries(xgboost_bench PRIVATE gbdt benchmark::benchmark ${RELIQA_XGBOOST_LIBRARY})
 target_compile_definitions(xgboost_bench PRIVATE RELIQA_XGBOOST_BENCH_MODELS="${_xgb_models}")
+
+# Contributions of the benchmark models against XGBoost's pred_contribs, on
+# rows with and without NaN (trains the models first if they are missing).
+if(RELIQA_PYTHON)
+  add_test(NAME trainer_contributions
+    COMMAND ${RELIQA_BENCH_PYTHON} ${CMAKE_CURRENT_LIST_DIR}/explain_bench.py --check
+            --models ${_xgb_models} --reliqa $<TARGET_FILE:reliqa>)
+  set_tests_properties(trainer_contributions PROPERTIES
+    ENVIRONMENT "${RELIQA_TEST_ENVIRONMENT};PYTHONPATH=${CMAKE_BINARY_DIR}/python"
+    TIMEOUT 900)
+endif()

@@ -9,6 +9,7 @@
 #include <pybind11/pybind11.h>
 #include <pybind11/stl.h>
 
+#include <algorithm>
 #include <charconv>
 #include <cmath>
 #include <cstdlib>
@@ -132,7 +133,12 @@ class Model {
       text = tool::convertXgboostJson(json, name, ids, "feature_ids=[...]").text;
     }
     Model model(std::move(text), name, "");
-    model.covers_ = tool::xgboostCovers(tool::readXgboostModel(json, name), *model.model_, name);
+    // A hand-written model may lack the hessian sums; it converts all the
+    // same and explains only over a background.
+    const tool::XgbModel xgb = tool::readXgboostModel(json, name);
+    const bool covered = std::all_of(xgb.trees.begin(), xgb.trees.end(),
+                                     [](const tool::XgbTree& t) { return !t.sumHessian.empty(); });
+    if (covered) model.covers_ = tool::xgboostCovers(xgb, *model.model_, name);
     return model;
   }
 
@@ -191,7 +197,7 @@ class Model {
       throw std::invalid_argument(
           "contributions need the cover of every tree node, which a model text does not hold: give background= "
           "rows (a node's cover is then how many of them reach it), or convert the model with "
-          "Model.from_xgboost(), which keeps the trainer's covers");
+          "Model.from_xgboost(), which keeps the trainer's covers (its sum_hessian)");
     }
     const size_t width = shap->numContributions() + 1;
     py::array_t<double> out({static_cast<py::ssize_t>(m.rows), static_cast<py::ssize_t>(width)});

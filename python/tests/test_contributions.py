@@ -2,6 +2,7 @@
 to on any model, the same bits for every thread count and after pickling,
 and clear refusals."""
 
+import json
 import os
 import pickle
 
@@ -87,3 +88,29 @@ def test_refusals_say_what_to_do(trained):
         trained.model.contributions(X, nthread=-5)
     # A background counted over rows replaces the trainer's covers.
     assert not np.array_equal(trained.model.contributions(X, background=X), trained.model.contributions(X))
+
+
+def test_nan_rows_match_xgboost_where_default_directions_agree(trained):
+    """NaN takes our trees' NaN branches (with missing=None): right at the
+    root, left below. XGBoost sends it the way each split learned. Given a
+    copy of the XGBoost model whose default directions are ours, the two
+    agree on rows with NaN too; with the learned ones they may not."""
+    rng = np.random.default_rng(11)
+    X = rows_without_nan(trained, 800, seed=13)
+    X[rng.random(X.shape) < 0.25] = np.nan
+    doc = json.loads(trained.json)
+    trees = doc["learner"]["gradient_booster"]["model"]["trees"]
+    learned = [t["default_left"][:] for t in trees]
+    for t in trees:
+        t["default_left"] = [0] + [1] * (len(t["default_left"]) - 1)
+    ours_directions = xgb.Booster()
+    ours_directions.load_model(bytearray(json.dumps(doc).encode()))
+    names = [str(i) for i in IDS]
+    ours = trained.model.contributions(X, missing=None)
+    theirs = ours_directions.predict(xgb.DMatrix(X, feature_names=names), pred_contribs=True)
+    np.testing.assert_allclose(ours, theirs, rtol=0, atol=1e-5)
+    # The trained model's own directions differ from ours at some splits,
+    # and then the contributions of some NaN rows differ.
+    assert any(d != e for t, l in zip(trees, learned) for d, e in zip(t["default_left"], l))
+    trained_contribs = trained.booster.predict(xgb.DMatrix(X, feature_names=names), pred_contribs=True)
+    assert np.abs(ours - trained_contribs).max() > 1e-3
