@@ -24,41 +24,14 @@ import resource
 import subprocess
 import sys
 import tempfile
-import time
 
 import numpy as np
 import xgboost as xgb
 
 import reliqa
+from bench_common import best_time, cpu_flags, cpu_model
 
 MODELS = ("m500_d6", "m2000_d8")
-FLAGS = ("fma", "sse4_2", "avx2", "bmi2", "avx512f")
-
-
-def cpu_flags():
-    with open("/proc/cpuinfo") as f:
-        for line in f:
-            if line.startswith("flags"):
-                have = set(line.split(":", 1)[1].split())
-                return " ".join(f for f in FLAGS if f in have) or "(none of " + " ".join(FLAGS) + ")"
-    return "unknown"
-
-
-def cpu_model():
-    with open("/proc/cpuinfo") as f:
-        for line in f:
-            if line.startswith("model name"):
-                return line.split(":", 1)[1].strip()
-    return "unknown"
-
-
-def best_time(fn, repeat):
-    best = float("inf")
-    for _ in range(repeat):
-        start = time.perf_counter()
-        fn()
-        best = min(best, time.perf_counter() - start)
-    return best
 
 
 def one_row_cpp(xgboost_bench):

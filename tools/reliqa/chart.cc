@@ -79,6 +79,16 @@ std::string shortValue(double v, bool sign) {
   return buf;
 }
 
+// The start of a chart of W x H pixels: the document, a white ground and the
+// title, centred at the top.
+std::string svgOpening(double W, double H, const std::string& title) {
+  return "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" + num(W) + "\" height=\"" + num(H) +
+         "\" viewBox=\"0 0 " + num(W) + " " + num(H) + "\" font-family=\"sans-serif\">\n" +
+         "<rect width=\"100%\" height=\"100%\" fill=\"white\"/>\n" + "<text x=\"" + num(W / 2) +
+         "\" y=\"30\" text-anchor=\"middle\" font-size=\"17\" font-weight=\"bold\">" + escapeXml(title) +
+         "</text>\n";
+}
+
 // Characters (not bytes) of a UTF-8 text, for estimating its width.
 size_t characters(const std::string& s) {
   size_t n = 0;
@@ -123,12 +133,7 @@ std::string renderSvg(const LineChart& c) {
   auto px = [&](double x) { return left + (x - xlo) / (xhi - xlo) * pw; };
   auto py = [&](double y) { return top + (1.0 - (y - ylo) / (yhi - ylo)) * ph; };
 
-  std::string s;
-  s += "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" + num(W) + "\" height=\"" + num(H) +
-       "\" viewBox=\"0 0 " + num(W) + " " + num(H) + "\" font-family=\"sans-serif\">\n";
-  s += "<rect width=\"100%\" height=\"100%\" fill=\"white\"/>\n";
-  s += "<text x=\"" + num(W / 2) + "\" y=\"30\" text-anchor=\"middle\" font-size=\"17\" font-weight=\"bold\">" +
-       escapeXml(c.title) + "</text>\n";
+  std::string s = svgOpening(W, H, c.title);
 
   // Grid and ticks.
   std::vector<double> xt = niceTicks(xlo, xhi, 8), yt = niceTicks(ylo, yhi, 6);
@@ -212,12 +217,7 @@ std::string renderSvg(const WaterfallChart& c) {
   auto px = [&](double x) { return left + (x - lo) / (hi - lo) * pw; };
   auto rowTop = [&](size_t i) { return top + rowHeight * static_cast<double>(i); };
 
-  std::string s;
-  s += "<svg xmlns=\"http://www.w3.org/2000/svg\" width=\"" + num(W) + "\" height=\"" + num(H) +
-       "\" viewBox=\"0 0 " + num(W) + " " + num(H) + "\" font-family=\"sans-serif\">\n";
-  s += "<rect width=\"100%\" height=\"100%\" fill=\"white\"/>\n";
-  s += "<text x=\"" + num(W / 2) + "\" y=\"30\" text-anchor=\"middle\" font-size=\"17\" font-weight=\"bold\">" +
-       escapeXml(c.title) + "</text>\n";
+  std::string s = svgOpening(W, H, c.title);
   s += "<text x=\"" + num(W / 2) + "\" y=\"52\" text-anchor=\"middle\" font-size=\"13\" fill=\"#555\">" +
        escapeXml(c.subtitle) + "</text>\n";
 
