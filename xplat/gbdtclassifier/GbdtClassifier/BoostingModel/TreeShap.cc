@@ -480,7 +480,9 @@ using Lanes = typename LaneTraits<K>::Lanes;
 
 // Loads and stores that need no alignment. These stay within this file, so
 // the note that wide vectors pass differently without AVX-512 is moot.
-#if defined(__GNUC__) && !defined(__clang__)
+#if defined(__clang__)
+#pragma clang diagnostic ignored "-Wpsabi"
+#elif defined(__GNUC__)
 #pragma GCC diagnostic ignored "-Wpsabi"
 #endif
 template <typename V>
