@@ -23,6 +23,7 @@
 #include <vector>
 
 #include "python/src/dense_scoring.h"
+#include "python/src/log_block.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "tools/common/classifier_store.h"
@@ -222,7 +223,51 @@ class Model {
     return py::array_t<double>(static_cast<py::ssize_t>(scores.size()), scores.data());
   }
 
+  // Reads and scores a block of logged lines (see log_block.h) into a dict of
+  // numpy arrays and counts.
+  py::dict replayBlock(const py::bytes& data, std::optional<std::string> label, int64_t firstLine,
+                       size_t maxLine, size_t maxReasons, bool careful) const {
+    char* bytes = nullptr;
+    py::ssize_t size = 0;
+    if (PyBytes_AsStringAndSize(data.ptr(), &bytes, &size) != 0) throw py::error_already_set();
+    LogBlock block;
+    {
+      py::gil_scoped_release release;  // `data` is immutable and held by the caller
+      block = reliqa::python::replayBlock(*model_, std::string_view(bytes, static_cast<size_t>(size)), label,
+                                          firstLine, maxLine, maxReasons, careful);
+    }
+    py::dict out;
+    out["candidate"] = asArray(block.candidate);
+    out["logged"] = asArray(block.logged);
+    out["threshold"] = asArray(block.threshold);
+    out["model"] = asArray(block.model);
+    out["label"] = asArray(block.label);
+    out["line"] = asArray(block.line);
+    py::list models;
+    for (const auto& id : block.models) models.append(utf8Text(id));
+    out["models"] = models;
+    out["lines"] = block.lines;
+    out["read"] = block.read;
+    out["refused"] = block.refused;
+    py::list reasons;
+    for (const auto& [line, why] : block.reasons) reasons.append(py::make_tuple(line, utf8Text(why)));
+    out["reasons"] = reasons;
+    return out;
+  }
+
  private:
+  template <typename T>
+  static py::array_t<T> asArray(const std::vector<T>& v) {
+    return py::array_t<T>(static_cast<py::ssize_t>(v.size()), v.data());
+  }
+
+  // Logged text as str; bytes that are not UTF-8 (a cut message) are replaced.
+  static py::str utf8Text(const std::string& s) {
+    PyObject* o = PyUnicode_DecodeUTF8(s.data(), static_cast<py::ssize_t>(s.size()), "replace");
+    if (o == nullptr) throw py::error_already_set();
+    return py::reinterpret_steal<py::str>(o);
+  }
+
   std::string text_;
   std::unique_ptr<thornvale::BoostingModel> model_;
 };
@@ -374,7 +419,9 @@ PYBIND11_MODULE(_native, m) {
       .def_property_readonly("base_score", &Model::baseScore)
       .def("predict", &Model::predict, py::arg("x"), py::arg("column_ids"), py::arg("missing"),
            py::arg("output_margin"), py::arg("nthread"))
-      .def("predict_rows", &Model::predictRows, py::arg("rows"), py::arg("missing"), py::arg("output_margin"));
+      .def("predict_rows", &Model::predictRows, py::arg("rows"), py::arg("missing"), py::arg("output_margin"))
+      .def("replay_block", &Model::replayBlock, py::arg("data"), py::arg("label"), py::arg("first_line"),
+           py::arg("max_line"), py::arg("max_reasons"), py::arg("careful") = false);
 
   m.def("extract_features", &extractFeatures, py::arg("texts"), py::arg("name"), py::arg("first_lines"));
   m.attr("FEATURE_COUNT") = kFeatureCount;

@@ -19,14 +19,52 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 
+#include "tools/common/json_doc.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMap.h"
 
 namespace reliqa::tool {
 
 thornvale::FeatureMap parseFeatureRow(std::string_view json, const std::string& name, int64_t firstLine = 1);
+
+// The id of a feature-row key: an optional '-' and 1 to 10 decimal digits
+// (leading zeros allowed) within the signed 32-bit range; nothing otherwise.
+std::optional<int32_t> featureRowIdSlowly(std::string_view key);
+inline std::optional<int32_t> featureRowId(std::string_view key) {
+  // Most keys are a few digits, read here at once.
+  if (key.empty() || key.size() > 9) return featureRowIdSlowly(key);
+  int32_t id = 0;
+  for (char c : key) {
+    if (c < '0' || c > '9') return featureRowIdSlowly(key);
+    id = id * 10 + (c - '0');
+  }
+  return id;
+}
+
+// One member of a feature row: its id and value, read as parseFeatureRow
+// reads them (with its messages). `key` is the member's unescaped key.
+struct FeatureMember {
+  int32_t id;
+  double value;
+};
+FeatureMember readFeatureMember(JsonDoc& doc, std::string_view key, simdjson::ondemand::value& v);
+
+// Reads the members of the feature-row object `row`, calling
+// onFeature(id, value) for each; onFeature returns false for an id given
+// before, which is refused as parseFeatureRow refuses it.
+template <class F>
+void readFeatureRow(JsonDoc& doc, simdjson::ondemand::object row, F&& onFeature) {
+  for (auto member : row) {
+    simdjson::ondemand::field f = doc.take(std::move(member), "");
+    std::string_view key = doc.take(f.unescaped_key(), "");
+    simdjson::ondemand::value v = f.value();
+    const FeatureMember m = readFeatureMember(doc, key, v);
+    if (!onFeature(m.id, m.value)) doc.fail(v, "feature " + std::to_string(m.id) + " appears twice");
+  }
+}
 
 thornvale::FeatureMap parseServerFeatures(std::string_view json, const std::string& name);
 
