@@ -190,6 +190,7 @@ def replay(
         try:
             if client is None:
                 client, own = _connect(scheduler, workers)
+            _check_workers(client)
             count = len(client.scheduler_info()["workers"])
             where = (f"Dask scheduler {scheduler}" if scheduler else
                      "a LocalCluster" if own is not None else "a Dask client's cluster")
@@ -368,7 +369,6 @@ def _check_workers(client) -> None:
 def _run_on_dask(client, model: Model, blocks: List[Block], judging: Judging) -> Optional[Tally]:
     from distributed import as_completed
 
-    _check_workers(client)
     if not blocks:
         return None
     # Once per worker: tasks get the model that the worker holds.
