@@ -190,13 +190,7 @@ class LineReader {
       }
       if (given != 0 || loggingData) {
         if (ids != 0 || given != kAll) return false;
-        if (vectorAsText) {
-          if (vectorText.size() > kQuickLimit) return false;
-          simdjson::dom::element inner;
-          if (quickInner_.parse(vectorText, inner)) return false;
-          tool::DomNumbers innerNumbers(vectorText);
-          quickVector(inner, innerNumbers);
-        }
+        if (vectorAsText && !quickVectorText(vectorText)) return false;
       } else if (ids == 0 && extra != 0) {
         return false;
       }
@@ -245,6 +239,45 @@ class LineReader {
       const std::optional<double> x = numbers.read(member.value);
       if (!x || !addFeature(*id, *x)) throw GiveUp{};
     }
+  }
+
+  // Twenty digits in a row or more: On-Demand misreads such numbers, which
+  // the careful pass reads itself.
+  static bool hasLongDigitRun(std::string_view token) {
+    if (token.size() < 20) return false;
+    size_t run = 0;
+    for (char c : token) {
+      run = c >= '0' && c <= '9' ? run + 1 : 0;
+      if (run >= 20) return true;
+    }
+    return false;
+  }
+
+  // The feature vector's text, read with simdjson On-Demand: every member is
+  // read, so the object is checked to its end; numbers with long runs of
+  // digits are left to the careful pass.
+  bool quickVectorText(std::string_view text) {
+    if (text.size() > kQuickLimit) return false;
+    if (innerPadded_.size() < text.size() + simdjson::SIMDJSON_PADDING) {
+      innerPadded_.resize(text.size() + simdjson::SIMDJSON_PADDING);
+    }
+    std::memcpy(innerPadded_.data(), text.data(), text.size());
+    simdjson::ondemand::document doc;
+    if (quickInner_.iterate(innerPadded_.data(), text.size(), innerPadded_.size()).get(doc)) return false;
+    object members;
+    if (doc.get_object().get(members)) return false;
+    for (auto member : members) {
+      field f;
+      std::string_view key;
+      if (std::move(member).get(f) || f.unescaped_key().get(key)) return false;
+      int32_t id;
+      if (!tool::readFeatureRowId(key, id)) return false;
+      value v = f.value();
+      double x;
+      if (hasLongDigitRun(v.raw_json_token()) || v.get_double().get(x) || !addFeature(id, x)) return false;
+    }
+    const char* at = nullptr;
+    return doc.current_location().get(at) != simdjson::SUCCESS;  // nothing after the object
   }
 
   Row readCarefully(std::string_view text, int64_t line, float* vector) {
@@ -437,7 +470,8 @@ class LineReader {
   JsonDoc outer_;  // the line
   JsonDoc inner_;  // the feature vector's text
   QuickParser quickOuter_;
-  QuickParser quickInner_;
+  simdjson::ondemand::parser quickInner_;
+  std::string innerPadded_;
   std::vector<uint32_t> table_;  // position of each small id
   std::vector<uint32_t> seen_;   // the stamp of the row that last gave each small id
   uint32_t stamp_ = 0;

@@ -33,15 +33,29 @@ thornvale::FeatureMap parseFeatureRow(std::string_view json, const std::string& 
 // The id of a feature-row key: an optional '-' and 1 to 10 decimal digits
 // (leading zeros allowed) within the signed 32-bit range; nothing otherwise.
 std::optional<int32_t> featureRowIdSlowly(std::string_view key);
-inline std::optional<int32_t> featureRowId(std::string_view key) {
+// The same, without an optional in the way of the loops that read many keys.
+inline bool readFeatureRowId(std::string_view key, int32_t& id) {
   // Most keys are a few digits, read here at once.
-  if (key.empty() || key.size() > 9) return featureRowIdSlowly(key);
-  int32_t id = 0;
-  for (char c : key) {
-    if (c < '0' || c > '9') return featureRowIdSlowly(key);
-    id = id * 10 + (c - '0');
+  if (!key.empty() && key.size() <= 9) {
+    uint32_t v = 0;  // nine digits fit; other bytes make a number that is dropped
+    bool digits = true;
+    for (char c : key) {
+      digits &= c >= '0' && c <= '9';
+      v = v * 10 + static_cast<uint32_t>(static_cast<unsigned char>(c) - '0');
+    }
+    if (digits) {
+      id = static_cast<int32_t>(v);
+      return true;
+    }
   }
-  return id;
+  const std::optional<int32_t> slowly = featureRowIdSlowly(key);
+  if (slowly) id = *slowly;
+  return slowly.has_value();
+}
+inline std::optional<int32_t> featureRowId(std::string_view key) {
+  int32_t id;
+  if (readFeatureRowId(key, id)) return id;
+  return std::nullopt;
 }
 
 // One member of a feature row: its id and value, read as parseFeatureRow
