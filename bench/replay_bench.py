@@ -97,11 +97,15 @@ def native_rate(model, path, lines=200_000):
     return rows["candidate"].size / best
 
 
+# The peak is the process's VmHWM: ru_maxrss would start from the resident
+# size of the process that started it (Linux carries it across exec).
 PEAK_RSS_CHILD = """
-import json, resource, sys, reliqa
+import json, sys, reliqa
 logs = json.loads(sys.argv[2])
 report = reliqa.replay(logs, sys.argv[1], label="opened", workers=2)
-print(report.data["logs"]["lines_read"], resource.getrusage(resource.RUSAGE_SELF).ru_maxrss)
+with open("/proc/self/status") as f:
+    peak = next(int(line.split()[1]) for line in f if line.startswith("VmHWM:"))
+print(report.data["logs"]["lines_read"], peak)
 """
 
 

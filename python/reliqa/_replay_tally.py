@@ -12,6 +12,7 @@ from __future__ import annotations
 
 import gzip
 import math
+import threading
 import zlib
 from dataclasses import dataclass
 from typing import Dict, Iterator, List, Optional, Tuple
@@ -134,12 +135,11 @@ class Tally:
                               float(candidate[i])) for i in at]
                     setattr(self, name, _smallest(getattr(self, name) + found, MAX_EXAMPLES))
         if has.any():
-            keys = np.empty(int(has.sum()), dtype=[("model", np.int32), ("threshold", np.float64)])
-            keys["model"] = model[has]
-            keys["threshold"] = threshold[has] + 0.0  # -0 counts as 0
-            unique, counts = np.unique(keys, return_counts=True)
+            thresholds, which = np.unique(threshold[has] + 0.0, return_inverse=True)  # -0 counts as 0
+            counts = np.bincount(model[has].astype(np.int64) * thresholds.size + which)
             models = rows["models"]
-            self._add_pairs({(models[m], t): c for (m, t), c in zip(unique.tolist(), counts.tolist())})
+            self._add_pairs({(models[key // thresholds.size], float(thresholds[key % thresholds.size])):
+                             int(counts[key]) for key in np.flatnonzero(counts).tolist()})
 
     def _add_pairs(self, pairs: Dict[Tuple[str, float], int]) -> None:
         for key, count in pairs.items():
@@ -242,14 +242,30 @@ def _range_pieces(f, start: int, end: int, max_line: int) -> Iterator[bytes]:
     begin = f.tell()
     if begin >= end:
         return
-    data = f.read(end - begin)
-    if len(data) == end - begin and not data.endswith(b"\n"):
-        # The last line runs on past the block: read it to its end, or far
-        # enough to refuse it for its length.
-        tail = f.read(max_line + 1)
-        cut = tail.find(b"\n")
-        data += tail[:cut + 1] if cut >= 0 else tail
-    yield data
+    # The block, and enough after it to end its last line (or to refuse that
+    # line for its length), read at once into this thread's buffer.
+    size = end - begin
+    data = _buffer(size + max_line + 1)
+    got = f.readinto(memoryview(data)[:size + max_line + 1])
+    view = memoryview(data)[:got]
+    if got > size and data[size - 1] != 0x0A:
+        cut = data.find(b"\n", size - 1, got)
+        view = view[:cut + 1] if cut >= 0 else view
+    elif got > size:
+        view = view[:size]
+    yield view.toreadonly()
+
+
+_local = threading.local()
+
+
+def _buffer(size: int) -> bytearray:
+    """A buffer of at least `size` bytes, kept by the thread for its next
+    block: fresh memory would cost a page fault every 4 KiB."""
+    data = getattr(_local, "buffer", None)
+    if data is None or len(data) < size:
+        data = _local.buffer = bytearray(size)
+    return data
 
 
 def _skip_line(f) -> bool:

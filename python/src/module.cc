@@ -225,15 +225,18 @@ class Model {
 
   // Reads and scores a block of logged lines (see log_block.h) into a dict of
   // numpy arrays and counts.
-  py::dict replayBlock(const py::bytes& data, std::optional<std::string> label, int64_t firstLine,
+  py::dict replayBlock(const py::buffer& data, std::optional<std::string> label, int64_t firstLine,
                        size_t maxLine, size_t maxReasons, bool careful) const {
-    char* bytes = nullptr;
-    py::ssize_t size = 0;
-    if (PyBytes_AsStringAndSize(data.ptr(), &bytes, &size) != 0) throw py::error_already_set();
+    // The buffer stays exported (so it cannot be resized) until `view` goes.
+    const py::buffer_info view = data.request();
+    if (view.ndim > 1 || (view.ndim == 1 && view.strides[0] != view.itemsize)) {
+      throw std::invalid_argument("the lines must be one run of bytes");
+    }
+    const auto size = static_cast<size_t>(view.size * view.itemsize);
     LogBlock block;
     {
-      py::gil_scoped_release release;  // `data` is immutable and held by the caller
-      block = reliqa::python::replayBlock(*model_, std::string_view(bytes, static_cast<size_t>(size)), label,
+      py::gil_scoped_release release;
+      block = reliqa::python::replayBlock(*model_, std::string_view(static_cast<const char*>(view.ptr), size), label,
                                           firstLine, maxLine, maxReasons, careful);
     }
     py::dict out;
