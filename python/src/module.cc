@@ -23,7 +23,7 @@
 #include <vector>
 
 #include "python/src/dense_scoring.h"
-#include "python/src/log_block.h"
+#include "tools/common/log_block.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "tools/common/classifier_store.h"
@@ -233,10 +233,10 @@ class Model {
       throw std::invalid_argument("the lines must be one run of bytes");
     }
     const auto size = static_cast<size_t>(view.size * view.itemsize);
-    LogBlock block;
+    tool::LogBlock block;
     {
       py::gil_scoped_release release;
-      block = reliqa::python::replayBlock(*model_, std::string_view(static_cast<const char*>(view.ptr), size), label,
+      block = tool::replayBlock(*model_, std::string_view(static_cast<const char*>(view.ptr), size), label,
                                           firstLine, maxLine, maxReasons, careful);
     }
     py::dict out;

@@ -28,7 +28,7 @@
 
 #include "xplat/gbdtclassifier/GbdtClassifier/BoostingModel/BoostingModel.h"
 
-namespace reliqa::python {
+namespace reliqa::tool {
 
 struct LogBlock {
   // One entry per row read, in the order of the lines.
@@ -58,4 +58,4 @@ LogBlock replayBlock(const thornvale::BoostingModel& model, std::string_view dat
                      const std::optional<std::string>& label, int64_t firstLine, size_t maxLine,
                      size_t maxReasons, bool careful = false);
 
-}  // namespace reliqa::python
+}  // namespace reliqa::tool

@@ -1,4 +1,4 @@
-#include "python/src/log_block.h"
+#include "tools/common/log_block.h"
 
 #include <algorithm>
 #include <charconv>
@@ -14,7 +14,7 @@
 #include "xplat/gbdtclassifier/GbdtClassifier/FastTreeEnsemble.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/NumberText.h"
 
-namespace reliqa::python {
+namespace reliqa::tool {
 
 namespace {
 
@@ -22,9 +22,9 @@ using simdjson::ondemand::field;
 using simdjson::ondemand::json_type;
 using simdjson::ondemand::object;
 using simdjson::ondemand::value;
-using tool::JsonDoc;
-using tool::quoteForMessage;
-using tool::ToolError;
+
+
+
 
 // Rows scored together, as the dense scorer does.
 constexpr size_t kBlockRows = 64;
@@ -125,7 +125,7 @@ class LineReader {
       if (quickOuter_.parse(text, root)) return false;
       simdjson::dom::object members;
       if (root.get_object().get(members)) return false;
-      tool::DomNumbers numbers(text);
+      DomNumbers numbers(text);
       unsigned given = 0;
       unsigned givenOutside = 0;
       bool loggingData = false;
@@ -176,7 +176,7 @@ class LineReader {
           }
         } else if (key == "isOverThreshold") {
           // The verdict follows from the score and the threshold.
-        } else if (const std::optional<int32_t> id = tool::featureRowId(key)) {
+        } else if (const std::optional<int32_t> id = featureRowId(key)) {
           const std::optional<double> x = numbers.read(member.value);
           if (!x || !addFeature(*id, *x)) return false;
           ++ids;
@@ -208,7 +208,7 @@ class LineReader {
     return s;
   }
 
-  double quickLoggedNumber(simdjson::dom::element v, tool::DomNumbers& numbers) {
+  double quickLoggedNumber(simdjson::dom::element v, DomNumbers& numbers) {
     double x = 0.0;
     if (v.is_string()) {
       const std::string_view text = v.get_string().value_unsafe();
@@ -223,18 +223,18 @@ class LineReader {
     return x;
   }
 
-  int8_t quickLabel(simdjson::dom::element v, tool::DomNumbers& numbers) {
+  int8_t quickLabel(simdjson::dom::element v, DomNumbers& numbers) {
     if (v.is_bool()) return v.get_bool().value_unsafe() ? 1 : 0;
     const std::optional<double> x = numbers.read(v);
     if (x && (*x == 0.0 || *x == 1.0)) return static_cast<int8_t>(*x);
     throw GiveUp{};
   }
 
-  void quickVector(simdjson::dom::element v, tool::DomNumbers& numbers) {
+  void quickVector(simdjson::dom::element v, DomNumbers& numbers) {
     simdjson::dom::object members;
     if (v.get_object().get(members)) throw GiveUp{};
     for (simdjson::dom::key_value_pair member : members) {
-      const std::optional<int32_t> id = tool::featureRowId(member.key);
+      const std::optional<int32_t> id = featureRowId(member.key);
       if (!id) throw GiveUp{};
       const std::optional<double> x = numbers.read(member.value);
       if (!x || !addFeature(*id, *x)) throw GiveUp{};
@@ -271,7 +271,7 @@ class LineReader {
       std::string_view key;
       if (std::move(member).get(f) || f.unescaped_key().get(key)) return false;
       int32_t id;
-      if (!tool::readFeatureRowId(key, id)) return false;
+      if (!readFeatureRowId(key, id)) return false;
       value v = f.value();
       double x;
       if (hasLongDigitRun(v.raw_json_token()) || v.get_double().get(x) || !addFeature(id, x)) return false;
@@ -352,8 +352,8 @@ class LineReader {
         }
       } else if (key == "isOverThreshold") {
         // The verdict follows from the score and the threshold.
-      } else if (tool::featureRowId(key)) {
-        const tool::FeatureMember m = tool::readFeatureMember(outer_, key, v);
+      } else if (featureRowId(key)) {
+        const FeatureMember m = readFeatureMember(outer_, key, v);
         if (!addFeature(m.id, m.value)) outer_.fail(v, "feature " + std::to_string(m.id) + " appears twice");
         ++ids;
       } else {
@@ -430,7 +430,7 @@ class LineReader {
   }
 
   void readVector(JsonDoc& doc, object row) {
-    tool::readFeatureRow(doc, row, [&](int32_t id, double x) { return addFeature(id, x); });
+    readFeatureRow(doc, row, [&](int32_t id, double x) { return addFeature(id, x); });
   }
 
   // A logged score or threshold: the phone's number text, or a JSON number.
@@ -538,4 +538,4 @@ LogBlock replayBlock(const thornvale::BoostingModel& model, std::string_view dat
   return out;
 }
 
-}  // namespace reliqa::python
+}  // namespace reliqa::tool
