@@ -13,6 +13,7 @@ import hashlib
 import logging
 import math
 import os
+import sys
 import time
 from concurrent.futures import FIRST_COMPLETED, ThreadPoolExecutor, wait
 from typing import Any, Dict, List, Optional, Sequence, Tuple, Union
@@ -33,6 +34,7 @@ DEFAULT_BLOCKSIZE = 64 << 20
 of work, so that Dask's millisecond per task does not count."""
 
 _MERGE_FAN_IN = 8
+_WORKER_START_SECONDS = 60
 _LOGGING_KEYS = {"score", "model_id", "feature_vector", "threshold", "loggingData", "isOverThreshold"}
 
 
@@ -339,10 +341,36 @@ def _connect(scheduler: Optional[str], workers: Optional[int]):
         except (OSError, TimeoutError) as e:
             raise ReplayError(f"cannot reach the Dask scheduler at {scheduler}: {e}") from None
         return client, None
-    cluster = LocalCluster(n_workers=workers or os.cpu_count() or 1, threads_per_worker=1, processes=True,
-                           dashboard_address=None, silence_logs=logging.ERROR)
+    import multiprocessing
+
+    main = sys.modules.get("__main__")
+    if getattr(main, "__name__", "") == "__mp_main__" or getattr(multiprocessing.current_process(), "_inheriting", False):
+        # A worker process starts by importing the script that started the
+        # cluster; without this it would start a cluster of its own, and so on.
+        raise ReplayError("a LocalCluster cannot be started while a worker process starts: a script that "
+                          "replays on one does so under 'if __name__ == \"__main__\":'")
+    count = workers or os.cpu_count() or 1
+    cluster = LocalCluster(n_workers=0, threads_per_worker=1, processes=True, dashboard_address=None,
+                           silence_logs=logging.ERROR)
     try:
-        return Client(cluster), cluster
+        client = Client(cluster)
+        # Workers that cannot start are restarted for ever: wait for them a while only.
+        cluster.scale(count)
+        try:
+            client.wait_for_workers(count, timeout=_WORKER_START_SECONDS)
+        except Exception:  # a TimeoutError of the event loop's kind
+            client.close()
+            try:
+                cluster.close(timeout=10)  # nannies busy restarting may not answer
+            except Exception:
+                pass
+            raise ReplayError(f"the LocalCluster's {count} worker process(es) did not start within "
+                              f"{_WORKER_START_SECONDS} s; a script that replays on a LocalCluster does so under "
+                              "'if __name__ == \"__main__\":', since each worker process starts by importing it"
+                              ) from None
+        return client, cluster
+    except ReplayError:
+        raise
     except BaseException:
         cluster.close()
         raise
