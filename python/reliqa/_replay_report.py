@@ -430,6 +430,9 @@ def report_html(data: Dict[str, Any], tally: Tally) -> str:
         parts.append(f"<p class='note'>{judged['unjudged_rows']:,} bare feature rows have no logged threshold "
                      "to judge the candidate at; they count in the scores and curves only.</p>")
     examples = data["flips"].get("examples")
+    if examples is None:
+        parts.append("<p class='note'>Flipped rows are listed by line when the candidate's threshold is known "
+                     "before the run (a fixed threshold, or the logged ones).</p>")
     if examples:
         for key, title in (("shown_to_hidden", "First rows shown by the baseline and hidden by the candidate"),
                            ("hidden_to_shown", "First rows hidden by the baseline and shown by the candidate")):
@@ -460,9 +463,12 @@ def report_html(data: Dict[str, Any], tally: Tally) -> str:
         parts.append(f"<p>{lab['positives']:,} positive and {lab['negatives']:,} negative rows "
                      f"({lab['positives_with_baseline']:,} and {lab['negatives_with_baseline']:,} with a baseline).</p>")
         rows = []
-        for who, name in (("candidate", "candidate, all rows"),
-                          ("candidate_on_baseline_rows", "candidate, rows with a baseline"),
-                          ("baseline", "baseline (logged scores)")):
+        shown_models = [("candidate", "candidate, all rows"),
+                        ("candidate_on_baseline_rows", "candidate, rows with a baseline"),
+                        ("baseline", "baseline (logged scores)")]
+        if data["rows"]["bare"] == 0:
+            del shown_models[1]  # the same rows
+        for who, name in shown_models:
             a, p = lab["auc"][who], lab["at_verdicts"][who]
             rows.append([name, _num(a["auc"]) if a else "–", f"± {a['error_bound']:.2g}" if a else "–",
                          _pct(p["precision"]), _pct(p["recall"]), f"{p['shown']:,}"])
