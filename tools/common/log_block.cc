@@ -35,10 +35,14 @@ bool isBlank(std::string_view text) {
   return text.find_first_not_of(" \t\r") == std::string_view::npos;
 }
 
-// A DOM parser with its own padded copy of each text.
+// A DOM parser that reads a text in place when simdjson's padding after it
+// can be read (`readable` bytes from its start), else a padded copy.
 class QuickParser {
  public:
-  simdjson::error_code parse(std::string_view text, simdjson::dom::element& root) {
+  simdjson::error_code parse(std::string_view text, size_t readable, simdjson::dom::element& root) {
+    if (readable >= text.size() + simdjson::SIMDJSON_PADDING) {
+      return parser_.parse(text.data(), text.size(), false).get(root);
+    }
     if (padded_.size() < text.size() + simdjson::SIMDJSON_PADDING) {
       padded_.resize(text.size() + simdjson::SIMDJSON_PADDING);
     }
@@ -102,9 +106,10 @@ class LineReader {
   // Reads `text` (line `line`), filling `vector` (vectorLength floats).
   // Throws ToolError for a line that is not a row. `careful` skips the quick
   // pass (to compare the two).
-  Row read(std::string_view text, int64_t line, float* vector, bool careful) {
+  // `readable` bytes from the start of `text` may be read.
+  Row read(std::string_view text, size_t readable, int64_t line, float* vector, bool careful) {
     Row row;
-    if (!careful && readQuickly(text, vector, row)) return row;
+    if (!careful && readQuickly(text, readable, vector, row)) return row;
     return readCarefully(text, line, vector);
   }
 
@@ -115,14 +120,14 @@ class LineReader {
   static constexpr size_t kQuickLimit = size_t{1} << 20;
   struct GiveUp {};
 
-  bool readQuickly(std::string_view text, float* vector, Row& row) {
+  bool readQuickly(std::string_view text, size_t readable, float* vector, Row& row) {
     if (text.size() > kQuickLimit) return false;
     vector_ = vector;
     std::fill(vector, vector + model_.vectorLength(), 0.0f);
     startVector();
     try {
       simdjson::dom::element root;
-      if (quickOuter_.parse(text, root)) return false;
+      if (quickOuter_.parse(text, readable, root)) return false;
       simdjson::dom::object members;
       if (root.get_object().get(members)) return false;
       DomNumbers numbers(text);
@@ -489,6 +494,7 @@ LogBlock replayBlock(const thornvale::BoostingModel& model, std::string_view dat
   const size_t length = model.vectorLength();
   std::vector<float> vectors(kBlockRows * std::max<size_t>(length, 1));
   std::unordered_map<std::string, int32_t> modelIndex;
+  int32_t lastModel = -1;
   size_t pending = 0;  // rows read into `vectors`, not yet scored
   auto score = [&] {
     if (pending == 0) return;
@@ -514,7 +520,8 @@ LogBlock replayBlock(const thornvale::BoostingModel& model, std::string_view dat
       if (text.size() > maxLine) {
         throw ToolError("", here, "the line is longer than " + std::to_string(maxLine) + " bytes");
       }
-      row = reader.read(text, here, vectors.data() + pending * length, careful);
+      row = reader.read(text, static_cast<size_t>(end - text.data()), here, vectors.data() + pending * length,
+                        careful);
     } catch (const ToolError& e) {
       ++out.refused;
       if (out.reasons.size() < maxReasons) out.reasons.emplace_back(here, e.what());
@@ -522,8 +529,13 @@ LogBlock replayBlock(const thornvale::BoostingModel& model, std::string_view dat
     }
     int32_t index = -1;
     if (row.modelId) {
-      index = modelIndex.emplace(*row.modelId, static_cast<int32_t>(out.models.size())).first->second;
-      if (index == static_cast<int32_t>(out.models.size())) out.models.push_back(std::move(*row.modelId));
+      if (lastModel >= 0 && *row.modelId == out.models[static_cast<size_t>(lastModel)]) {
+        index = lastModel;  // logs come mostly in runs of one model
+      } else {
+        index = modelIndex.emplace(*row.modelId, static_cast<int32_t>(out.models.size())).first->second;
+        if (index == static_cast<int32_t>(out.models.size())) out.models.push_back(std::move(*row.modelId));
+        lastModel = index;
+      }
     }
     out.logged.push_back(row.logged);
     out.threshold.push_back(row.threshold);
