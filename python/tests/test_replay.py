@@ -25,6 +25,20 @@ distributed = pytest.importorskip("distributed")
 
 LABEL = "opened"
 MODELS = (("m-2024-05", "0.5"), ("m-2024-06", "0.35"))
+# Lines that are not rows, with a part of the reason each is refused for.
+BAD_LINES = [
+    ("not JSON at all", "not JSON"),
+    ('{"score":"0.5","model_id":"m","threshold":"0.5","opened":true}', "no logged feature_vector"),
+    ('{"1":"x","opened":true}', "expected a number"),
+    ('{"1":1,"01":2,"opened":false}', "feature 1 appears twice"),
+    ('{"1":1,"2":3}', 'no label "opened"'),
+    ('{"1":1,"opened":"yes"}', "expected true, false, 0 or 1"),
+    ('{"1":1,"opened":true} trailing', "unexpected text after the end"),
+    ('{"score":"0.5","model_id":"m","feature_vector":"[1,2]","threshold":"0.5","opened":0}',
+     "feature_vector: expected a feature vector"),
+    ('{"score":"NaN","model_id":"m","feature_vector":"{}","threshold":"0.5","opened":0}', "is not a finite number"),
+    ('{"user":"u1","opened":true}', "neither a classification result"),
+]
 
 
 def number_texts(rng, x):
@@ -99,29 +113,8 @@ def logs(trained, tmp_path_factory):
         if i % 211 == 0:
             lines.append("")
         if i % 150 == 7:
-            k = (i // 150) % 10
-            if k == 0:
-                add("not JSON at all", why="not JSON")
-            elif k == 1:
-                add('{"score":"0.5","model_id":"m","threshold":"0.5","opened":true}', why="no logged feature_vector")
-            elif k == 2:
-                add('{"1":"x","opened":true}', why="expected a number")
-            elif k == 3:
-                add('{"1":1,"01":2,"opened":false}', why="feature 1 appears twice")
-            elif k == 4:
-                add('{"1":1,"2":3}', why='no label "opened"')
-            elif k == 5:
-                add('{"1":1,"opened":"yes"}', why="expected true, false, 0 or 1")
-            elif k == 6:
-                add('{"1":1,"opened":true} trailing', why="unexpected text after the end")
-            elif k == 7:
-                add('{"score":"0.5","model_id":"m","feature_vector":"[1,2]","threshold":"0.5","opened":0}',
-                    why="feature_vector: expected a feature vector")
-            elif k == 8:
-                add('{"score":"NaN","model_id":"m","feature_vector":"{}","threshold":"0.5","opened":0}',
-                    why="is not a finite number")
-            else:
-                add('{"user":"u1","opened":true}', why="neither a classification result")
+            text, why = BAD_LINES[(i // 150) % len(BAD_LINES)]
+            add(text, why=why)
     half = len(lines) // 2
     plain = folder / "day-1.jsonl"
     plain.write_text("\n".join(lines[:half]) + "\n")

@@ -103,10 +103,9 @@ class LineReader {
     }
   }
 
-  // Reads `text` (line `line`), filling `vector` (vectorLength floats).
-  // Throws ToolError for a line that is not a row. `careful` skips the quick
-  // pass (to compare the two).
-  // `readable` bytes from the start of `text` may be read.
+  // Reads `text` (line `line`; `readable` bytes from its start may be read),
+  // filling `vector` (vectorLength floats). Throws ToolError for a line that
+  // is not a row. `careful` skips the quick pass (to compare the two).
   Row read(std::string_view text, size_t readable, int64_t line, float* vector, bool careful) {
     Row row;
     if (!careful && readQuickly(text, readable, vector, row)) return row;
