@@ -1,10 +1,8 @@
 #include "tools/common/log_block.h"
 
 #include <algorithm>
-#include <charconv>
 #include <cmath>
 #include <cstring>
-#include <system_error>
 #include <unordered_map>
 #include <utility>
 
@@ -33,6 +31,15 @@ constexpr uint32_t kTableIds = 4096;
 
 bool isBlank(std::string_view text) {
   return text.find_first_not_of(" \t\r") == std::string_view::npos;
+}
+
+// A logged number text, read as the store reads its threshold.
+std::optional<double> numberText(std::string_view text) {
+  try {
+    return thornvale::textToDouble(text);
+  } catch (const std::exception&) {
+    return std::nullopt;
+  }
 }
 
 // A DOM parser that reads a text in place when simdjson's padding after it
@@ -215,9 +222,9 @@ class LineReader {
   double quickLoggedNumber(simdjson::dom::element v, DomNumbers& numbers) {
     double x = 0.0;
     if (v.is_string()) {
-      const std::string_view text = v.get_string().value_unsafe();
-      const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), x);
-      if (text.empty() || error != std::errc() || end != text.data() + text.size()) throw GiveUp{};
+      const std::optional<double> read = numberText(v.get_string().value_unsafe());
+      if (!read) throw GiveUp{};
+      x = *read;
     } else {
       const std::optional<double> number = numbers.read(v);
       if (!number) throw GiveUp{};
@@ -444,10 +451,9 @@ class LineReader {
     double x = 0.0;
     if (t == json_type::string) {
       const std::string text = outer_.getString(v, path);
-      const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), x);
-      if (text.empty() || error != std::errc() || end != text.data() + text.size()) {
-        outer_.fail(v, path + ": expected a number text, got " + quoteForMessage(text));
-      }
+      const std::optional<double> read = numberText(text);
+      if (!read) outer_.fail(v, path + ": expected a number text, got " + quoteForMessage(text));
+      x = *read;
     } else if (t == json_type::number) {
       x = outer_.getDouble(v, path);
     } else {
