@@ -236,9 +236,11 @@ def _pieces(block: Block, max_line: int) -> Iterator[bytes]:
 
 def _range_pieces(f, start: int, end: int, max_line: int) -> Iterator[bytes]:
     if start > 0:
+        # The line holding `start - 1` began in the block before (it ends
+        # there when that byte is its newline).
         f.seek(start - 1)
-        if f.read(1) != b"\n" and not _skip_line(f):
-            return  # the line holding `start` began in the block before
+        if not _skip_line(f):
+            return
     begin = f.tell()
     if begin >= end:
         return
@@ -305,6 +307,6 @@ def _stream_pieces(f, max_line: int) -> Iterator[bytes]:
         if len(carry) > max_line:
             # Too long: handed over cut short (the reader refuses it for its
             # length); the rest of it is skipped.
-            yield carry[:max_line + 1] + b"\n"
+            yield carry[:max_line + 1]
             carry = b""
             skipping = True

@@ -282,6 +282,48 @@ def test_verdicts_and_flips_at_each_way_of_judging(trained, logs, expected):
     check(report, expected > t, np.ones(len(good), bool))
 
 
+def test_every_line_is_read_once_however_the_files_are_cut(trained, tmp_path, monkeypatch):
+    """Lines across block edges, lines too long (refused, however they are
+    cut), blank and CRLF lines, no newline at the end: the same counts and
+    line numbers for any block size, and for a compressed copy read in small
+    pieces."""
+    from reliqa import _replay_tally
+
+    rng = random.Random(11)
+    lines = []
+    for i in range(160):
+        r = rng.random()
+        if r < 0.1:
+            lines.append("")
+        elif r < 0.2:
+            lines.append('{"1":' + "1" * rng.randint(200, 700) + ',"opened":true}')  # too long
+        elif r < 0.3:
+            lines.append("bad" * rng.randint(1, 30))
+        else:
+            lines.append(json.dumps({"1": rng.random(), "2": rng.random() * 10, LABEL: i % 3 == 0})
+                         + ("\r" if i % 7 == 0 else ""))
+    plain = tmp_path / "cut.jsonl"
+    plain.write_text("\n".join(lines))
+    packed = tmp_path / "cut.jsonl.gz"
+    packed.write_bytes(gzip.compress(plain.read_bytes()))
+
+    def counts(path, **kwargs):
+        r = reliqa.replay(path, trained.model, label=LABEL, in_process=True, max_line=150, **kwargs)
+        refusals = [line.split(":", 1)[1] for line in r.data["logs"]["refusals"]]  # without the file
+        return r.tally.read, r.tally.refused, refusals, r.tally.candidate.tobytes(), r.data["logs"]["files"][0]["lines"]
+
+    whole = counts(plain)
+    assert whole[0] == sum(1 for l in lines if l.strip()) and whole[4] == len(lines)
+    too_long = [i + 1 for i, l in enumerate(lines) if len(l) > 150]
+    last = int(whole[2][-1].split(":")[0])
+    assert [int(r.split(":")[0]) for r in whole[2] if "longer than 150 bytes" in r] == [i for i in too_long
+                                                                                        if i <= last]
+    for blocksize in (61, 150, 999):
+        assert counts(plain, blocksize=blocksize) == whole, blocksize
+    monkeypatch.setattr(_replay_tally, "STREAM_PIECE", 97)
+    assert counts(packed) == whole
+
+
 def test_a_worker_killed_mid_run_changes_nothing(trained, logs, cluster, tmp_path):
     big = tmp_path / "big.jsonl"
     big.write_bytes(logs["files"][0].read_bytes() * 6)
