@@ -166,6 +166,11 @@ def replay(
     started = time.perf_counter()
     target = _check_options(threshold, show_rate, precision, label, workers, blocksize, max_line,
                             scheduler, client, in_process)
+    if out is not None:
+        try:
+            import matplotlib  # noqa: F401  (the page's charts; better said now than after the run)
+        except ImportError as e:
+            raise ReplayError(f"writing the report page needs matplotlib ({e}); install python3-matplotlib") from None
     if isinstance(model, Model):
         model_name = "the candidate model"
     else:
@@ -240,8 +245,8 @@ def _check_options(threshold, show_rate, precision, label, workers, blocksize, m
             raise ReplayError(f"label {label!r} is a logging value or a feature id, not a label member")
     if workers is not None and not (isinstance(workers, int) and 1 <= workers <= 4096):
         raise ReplayError(f"workers must be a count from 1 to 4096, got {workers!r}")
-    if not (isinstance(blocksize, int) and blocksize >= 1):
-        raise ReplayError(f"blocksize must be a positive number of bytes, got {blocksize!r}")
+    if not (isinstance(blocksize, int) and 1 <= blocksize <= 1 << 30):
+        raise ReplayError(f"blocksize must be from 1 byte to 1 GiB, got {blocksize!r}")
     if not (isinstance(max_line, int) and 1 <= max_line <= 1 << 30):
         raise ReplayError(f"max_line must be from 1 byte to 1 GiB, got {max_line!r}")
     if sum(bool(x) for x in (scheduler, client is not None, in_process)) > 1:
