@@ -16,7 +16,9 @@ model's probability.
 
 Then, with a LocalCluster started beforehand (its start is not timed):
   - the native reader alone (one block, one thread), the ceiling of a core;
-  - replay() with 1 worker and with 2 over all N lines: rows/s and the ratio;
+  - replay() with 1 worker and with 2 over all N lines: rows/s, the ratio, and
+    rows per CPU second that the workers used (which other jobs on the
+    machine change less than they change the time);
   - the driver's peak resident memory, each in a fresh process, replaying one
     file (N/2 lines) and both (N lines) on a LocalCluster of 2.
 Prints one table per part, headed by the CPU flags.
@@ -26,6 +28,7 @@ import argparse
 import json
 import math
 import os
+import resource
 import subprocess
 import sys
 import time
@@ -99,6 +102,16 @@ def native_rate(model, path, lines=200_000):
 
 # The peak is the process's VmHWM: ru_maxrss would start from the resident
 # size of the process that started it (Linux carries it across exec).
+def _cpu_seconds():
+    usage = resource.getrusage(resource.RUSAGE_SELF)
+    return usage.ru_utime + usage.ru_stime
+
+
+def worker_cpu(client):
+    """CPU seconds that the worker processes have used so far, in all."""
+    return sum(client.run(_cpu_seconds).values())
+
+
 PEAK_RSS_CHILD = """
 import json, sys, reliqa
 logs = json.loads(sys.argv[2])
@@ -131,22 +144,24 @@ def main():
 
     print(f"native reader and scorer alone, one thread: {native_rate(model, paths[0]):,.0f} rows/s\n")
 
-    print("| run | workers | seconds | rows/s | rows/s per worker |")
-    print("|---|---:|---:|---:|---:|")
+    print("| run | workers | seconds | rows/s | rows/s per worker | rows per CPU second of the workers |")
+    print("|---|---:|---:|---:|---:|---:|")
     rates = {}
     reports = {}
     for workers in (1, 2):
         with LocalCluster(n_workers=workers, threads_per_worker=1, processes=True, dashboard_address=None,
                           silence_logs=logging.ERROR) as cluster, Client(cluster) as client:
             reliqa.replay(paths[0], model, label="opened", client=client, blocksize=8 << 20)  # warm up
-            best = math.inf
+            best = cpu = math.inf
             for _ in range(args.repeat):
-                started = time.perf_counter()
+                started, cpu_before = time.perf_counter(), worker_cpu(client)
                 reports[workers] = reliqa.replay(paths, model, label="opened", client=client)
                 best = min(best, time.perf_counter() - started)
+                cpu = min(cpu, worker_cpu(client) - cpu_before)
         rows = reports[workers].data["logs"]["lines_read"]
         rates[workers] = rows / best
-        print(f"| LocalCluster | {workers} | {best:.2f} | {rates[workers]:,.0f} | {rates[workers] / workers:,.0f} |")
+        print(f"| LocalCluster | {workers} | {best:.2f} | {rates[workers]:,.0f} | {rates[workers] / workers:,.0f} "
+              f"| {rows / cpu:,.0f} |")
     same = json.dumps({k: v for k, v in reports[1].data.items() if k != "run"}) == \
         json.dumps({k: v for k, v in reports[2].data.items() if k != "run"})
     print(f"\ntwo workers over one: {rates[2] / rates[1]:.2f}x; the two reports are "
