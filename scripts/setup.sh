@@ -12,6 +12,7 @@ PACKAGES=(
   openjdk-17-jdk-headless junit5
   python3 python3-numpy python3-xgboost libxgboost-dev
   python3-dev pybind11-dev python3-pandas python3-pytest python3-venv python3-pip python3-wheel
+  python3-dask python3-distributed python3-matplotlib python3-psutil chromium
 )
 
 missing=()

@@ -1,8 +1,9 @@
 #!/usr/bin/env bash
 # Installs a reliqa wheel into a fresh virtual environment (made with
-# --system-site-packages, so that Debian's numpy, pandas and XGBoost are
+# --system-site-packages, so that Debian's numpy, pandas, XGBoost and Dask are
 # seen), without the network, and runs the README's Python example there,
-# outside the source tree.
+# outside the source tree; then a replay of the example logs on a LocalCluster,
+# whose worker processes must find the installed package.
 #   test-wheel.sh WHEEL
 set -euo pipefail
 wheel=$(realpath "$1")
@@ -18,6 +19,9 @@ awk '/<!-- wheel example -->/ {on = 1; next} on && /^```python/ {inside = 1; nex
 [ -s "$work/example.py" ] || { echo "test-wheel: no example found in README.md" >&2; exit 1; }
 cd "$work"
 RELIQA_SOURCE=$root TZ=UTC "$work/venv/bin/python" example.py
+TZ=UTC "$work/venv/bin/python" -m reliqa replay "$root/examples/replay_logs.jsonl" --model "$root/examples/model.txt" \
+  --label opened --workers 1 --out "$work/report"
+[ -s "$work/report/report.html" ] || { echo "test-wheel: the replay wrote no report" >&2; exit 1; }
 where=$("$work/venv/bin/python" -c 'import reliqa, os; print(os.path.dirname(reliqa.__file__))')
 case "$where" in
   "$work/venv/"*) echo "test-wheel: the example ran on the installed package ($where)" ;;

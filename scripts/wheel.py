@@ -27,6 +27,8 @@ import zipfile
 NAME = "reliqa"
 SUMMARY = "The phone's exact reliqa features and scores in numpy"
 REQUIRES = ("numpy", "pandas")
+# reliqa.replay() needs Dask, and matplotlib for its report page.
+EXTRAS = {"replay": ("dask", "distributed", "matplotlib")}
 DATE = (2020, 1, 1, 0, 0, 0)
 
 
@@ -84,7 +86,10 @@ def main():
             files[f"{NAME}/{name}"] = without_debug_info(os.path.join(package_dir, name))
     metadata = "\n".join(
         ["Metadata-Version: 2.1", f"Name: {NAME}", f"Version: {version}", f"Summary: {SUMMARY}",
-         "Requires-Python: >=3.11"] + [f"Requires-Dist: {r}" for r in REQUIRES]) + "\n"
+         "Requires-Python: >=3.11"] + [f"Requires-Dist: {r}" for r in REQUIRES]
+        + [line for extra, needs in EXTRAS.items()
+           for line in [f"Provides-Extra: {extra}"] + [f'Requires-Dist: {r}; extra == "{extra}"' for r in needs]]
+    ) + "\n"
     wheel = "\n".join(["Wheel-Version: 1.0", "Generator: reliqa scripts/wheel.py", "Root-Is-Purelib: false",
                        f"Tag: {impl}-{abi}-{platform}"]) + "\n"
     files[f"{dist_info}/METADATA"] = metadata.encode()

@@ -5,6 +5,8 @@
 # reliqa_xgboost:          reading XGBoost JSON models, converting them, and
 #                          taking node covers from them.
 # reliqa_classifier_store: a classifier over the SQLite store at a path.
+# reliqa_log_replay:       logged classification lines read and scored a block
+#                          at a time (the Python package's replay).
 set(_common_dir ${CMAKE_CURRENT_SOURCE_DIR}/common)
 
 add_library(reliqa_readers STATIC
@@ -28,3 +30,6 @@ reliqa_test(reliqa_xgboost_test
 
 add_library(reliqa_classifier_store STATIC ${_common_dir}/classifier_store.cc)
 target_link_libraries(reliqa_classifier_store PUBLIC reliqa_classifier keystash gbdt)
+
+add_library(reliqa_log_replay STATIC ${_common_dir}/log_block.cc)
+target_link_libraries(reliqa_log_replay PUBLIC reliqa_readers gbdt)

@@ -7,7 +7,10 @@ logistic, so that a score computed here is bit for bit the phone's:
   dense matrices, DataFrames and sparse rows;
 - :func:`features` computes the 74 features of collections into a DataFrame;
 - :class:`Classifier` classifies collections over the SQLite store that the
-  ``reliqa`` tool uses.
+  ``reliqa`` tool uses;
+- :func:`replay` scores logged classifications with a candidate model, on a
+  Dask cluster or in process, and reports what it would change
+  (``python3 -m reliqa replay`` from a shell).
 
 Example::
 
@@ -20,6 +23,7 @@ Example::
 from .model import Model
 from .features import features
 from .classifier import Classifier
+from ._replay import ReplayError, ReplayReport, replay
 
-__all__ = ["Model", "features", "Classifier"]
+__all__ = ["Model", "features", "Classifier", "replay", "ReplayReport", "ReplayError"]
 __version__ = "0.1.0"

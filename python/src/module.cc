@@ -24,6 +24,7 @@
 #include <vector>
 
 #include "python/src/dense_scoring.h"
+#include "tools/common/log_block.h"
 #include "reliqaclassifier/FeatureExtraction.h"
 #include "reliqaclassifier/ReliqasClassifier.h"
 #include "tools/common/classifier_store.h"
@@ -288,6 +289,41 @@ class Model {
     return py::array_t<double>(static_cast<py::ssize_t>(scores.size()), scores.data());
   }
 
+  // Reads and scores a block of logged lines (see log_block.h) into a dict of
+  // numpy arrays and counts.
+  py::dict replayBlock(const py::buffer& data, std::optional<std::string> label, int64_t firstLine,
+                       size_t maxLine, size_t maxReasons, bool careful) const {
+    // The buffer stays exported (so it cannot be resized) until `view` goes.
+    const py::buffer_info view = data.request();
+    if (view.ndim > 1 || (view.ndim == 1 && view.strides[0] != view.itemsize)) {
+      throw std::invalid_argument("the lines must be one run of bytes");
+    }
+    const auto size = static_cast<size_t>(view.size * view.itemsize);
+    tool::LogBlock block;
+    {
+      py::gil_scoped_release release;
+      block = tool::replayBlock(*model_, std::string_view(static_cast<const char*>(view.ptr), size), label,
+                                          firstLine, maxLine, maxReasons, careful);
+    }
+    py::dict out;
+    out["candidate"] = asArray(block.candidate);
+    out["logged"] = asArray(block.logged);
+    out["threshold"] = asArray(block.threshold);
+    out["model"] = asArray(block.model);
+    out["label"] = asArray(block.label);
+    out["line"] = asArray(block.line);
+    py::list models;
+    for (const auto& id : block.models) models.append(utf8Text(id));
+    out["models"] = models;
+    out["lines"] = block.lines;
+    out["read"] = block.read;
+    out["refused"] = block.refused;
+    py::list reasons;
+    for (const auto& [line, why] : block.reasons) reasons.append(py::make_tuple(line, utf8Text(why)));
+    out["reasons"] = reasons;
+    return out;
+  }
+
  private:
   // `x` as a Matrix, without a copy; `what` names it in messages.
   static Matrix matrixOf(const py::array& x, const std::string& what) {
@@ -345,6 +381,18 @@ class Model {
       if (s->right) pending.push_back(s->right.get());
     }
     return count;
+  }
+
+  template <typename T>
+  static py::array_t<T> asArray(const std::vector<T>& v) {
+    return py::array_t<T>(static_cast<py::ssize_t>(v.size()), v.data());
+  }
+
+  // Logged text as str; bytes that are not UTF-8 (a cut message) are replaced.
+  static py::str utf8Text(const std::string& s) {
+    PyObject* o = PyUnicode_DecodeUTF8(s.data(), static_cast<py::ssize_t>(s.size()), "replace");
+    if (o == nullptr) throw py::error_already_set();
+    return py::reinterpret_steal<py::str>(o);
   }
 
   std::string text_;
@@ -506,7 +554,9 @@ PYBIND11_MODULE(_native, m) {
            py::arg("background_ids"), py::arg("missing"), py::arg("nthread"))
       .def_property_readonly("covers", &Model::covers)
       .def("set_covers", &Model::setCovers, py::arg("covers"))
-      .def("explainer_bytes", &Model::explainerBytes);
+      .def("explainer_bytes", &Model::explainerBytes)
+      .def("replay_block", &Model::replayBlock, py::arg("data"), py::arg("label"), py::arg("first_line"),
+           py::arg("max_line"), py::arg("max_reasons"), py::arg("careful") = false);
 
   m.def("extract_features", &extractFeatures, py::arg("texts"), py::arg("name"), py::arg("first_lines"));
   m.attr("FEATURE_COUNT") = kFeatureCount;

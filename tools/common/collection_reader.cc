@@ -62,17 +62,9 @@ class QuickReader {
   }
 
   double number(Value& v, const MemberPath&) {
-    switch (v.type()) {
-      case simdjson::dom::element_type::DOUBLE: return v.get_double().value_unsafe();
-      case simdjson::dom::element_type::UINT64: return static_cast<double>(v.get_uint64().value_unsafe());
-      case simdjson::dom::element_type::INT64: {
-        // The DOM reads "-0" as the integer 0; the number is -0.0.
-        int64_t i = v.get_int64().value_unsafe();
-        if (i == 0 && mayHoldMinusZero()) throw GiveUp{};
-        return static_cast<double>(i);
-      }
-      default: throw GiveUp{};
-    }
+    const std::optional<double> x = numbers_.read(v);
+    if (!x) throw GiveUp{};
+    return *x;
   }
 
   int64_t integer(Value& v, const MemberPath&, int64_t min, int64_t max) {
@@ -104,34 +96,9 @@ class QuickReader {
     return names.size();
   }
 
-  // Whether the text may hold the number -0: a "-0" after ':', ',' or '['
-  // and before ',', '}', ']' or white space. Conservative: such a sequence
-  // inside a string counts too.
-  bool mayHoldMinusZero() {
-    if (minusZero_ < 0) {
-      minusZero_ = 0;
-      auto space = [](char c) { return c == ' ' || c == '\n' || c == '\r' || c == '\t'; };
-      const char* begin = text_.data();
-      const char* end = begin + text_.size();
-      for (const char* p = begin; (p = static_cast<const char*>(std::memchr(p, '-', end - p))) != nullptr; ++p) {
-        if (end - p < 2 || p[1] != '0') continue;
-        const char* before = p;
-        while (before > begin && space(before[-1])) --before;
-        bool opens = before > begin && (before[-1] == ':' || before[-1] == ',' || before[-1] == '[');
-        char after = end - p > 2 ? p[2] : ' ';
-        bool closes = after == ',' || after == '}' || after == ']' || space(after);
-        if (opens && closes) {
-          minusZero_ = 1;
-          break;
-        }
-      }
-    }
-    return minusZero_ == 1;
-  }
-
   std::string_view text_;
   Value root_;
-  int minusZero_ = -1;  // unknown until needed
+  DomNumbers numbers_{text_};
 };
 
 class CarefulReader {

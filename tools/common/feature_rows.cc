@@ -22,16 +22,6 @@ using thornvale::FeatureMap;
 
 namespace {
 
-// Strict decimal id: optional '-', then 1 to 10 digits (no more than int32
-// needs, leading zeros included), within int32.
-std::optional<int32_t> strictId(std::string_view key) {
-  const size_t digits = key.size() - (!key.empty() && key[0] == '-' ? 1 : 0);
-  int32_t id = 0;
-  const auto [end, error] = std::from_chars(key.data(), key.data() + key.size(), id);
-  if (error != std::errc() || end != key.data() + key.size() || digits > 10) return std::nullopt;
-  return id;
-}
-
 // Why the store would not give `x` back as the same number, or nothing when
 // it would: the value goes through the store's own encoder and decoder.
 std::optional<std::string> whyNotStorable(int32_t id, double x) {
@@ -53,18 +43,26 @@ std::optional<std::string> whyNotStorable(int32_t id, double x) {
 
 }  // namespace
 
+std::optional<int32_t> featureRowIdSlowly(std::string_view key) {
+  // No more digits than int32 needs, leading zeros included.
+  const size_t digits = key.size() - (!key.empty() && key[0] == '-' ? 1 : 0);
+  int32_t id = 0;
+  const auto [end, error] = std::from_chars(key.data(), key.data() + key.size(), id);
+  if (error != std::errc() || end != key.data() + key.size() || digits > 10) return std::nullopt;
+  return id;
+}
+
+FeatureMember readFeatureMember(JsonDoc& doc, std::string_view key, value& v) {
+  std::optional<int32_t> id = featureRowId(key);
+  if (!id) doc.fail(v, "feature id " + quoteForMessage(key) + " is not a decimal 32-bit integer");
+  return {*id, doc.getDouble(v, "feature " + std::string(key))};
+}
+
 FeatureMap parseFeatureRow(std::string_view json, const std::string& name, int64_t firstLine) {
   JsonDoc doc(json, name, firstLine);
   FeatureMap out;
-  for (auto member : doc.rootObject("a feature row")) {
-    field f = doc.take(std::move(member), "");
-    std::string_view key = doc.take(f.unescaped_key(), "");
-    value v = f.value();
-    std::optional<int32_t> id = strictId(key);
-    if (!id) doc.fail(v, "feature id " + quoteForMessage(key) + " is not a decimal 32-bit integer");
-    double x = doc.getDouble(v, "feature " + std::string(key));
-    if (!out.emplace(*id, x).second) doc.fail(v, "feature " + std::to_string(*id) + " appears twice");
-  }
+  readFeatureRow(doc, doc.rootObject("a feature row"),
+                 [&](int32_t id, double x) { return out.emplace(id, x).second; });
   doc.expectEnd();
   return out;
 }

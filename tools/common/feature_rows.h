@@ -19,14 +19,66 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 
+#include "tools/common/json_doc.h"
 #include "xplat/gbdtclassifier/GbdtClassifier/FeatureMap.h"
 
 namespace reliqa::tool {
 
 thornvale::FeatureMap parseFeatureRow(std::string_view json, const std::string& name, int64_t firstLine = 1);
+
+// The id of a feature-row key: an optional '-' and 1 to 10 decimal digits
+// (leading zeros allowed) within the signed 32-bit range; nothing otherwise.
+std::optional<int32_t> featureRowIdSlowly(std::string_view key);
+// The same, without an optional in the way of the loops that read many keys.
+inline bool readFeatureRowId(std::string_view key, int32_t& id) {
+  // Most keys are a few digits, read here at once.
+  if (!key.empty() && key.size() <= 9) {
+    uint32_t v = 0;  // nine digits fit; other bytes make a number that is dropped
+    bool digits = true;
+    for (char c : key) {
+      digits &= c >= '0' && c <= '9';
+      v = v * 10 + static_cast<uint32_t>(static_cast<unsigned char>(c) - '0');
+    }
+    if (digits) {
+      id = static_cast<int32_t>(v);
+      return true;
+    }
+  }
+  const std::optional<int32_t> slowly = featureRowIdSlowly(key);
+  if (slowly) id = *slowly;
+  return slowly.has_value();
+}
+inline std::optional<int32_t> featureRowId(std::string_view key) {
+  int32_t id;
+  if (readFeatureRowId(key, id)) return id;
+  return std::nullopt;
+}
+
+// One member of a feature row: its id and value, read as parseFeatureRow
+// reads them (with its messages). `key` is the member's unescaped key.
+struct FeatureMember {
+  int32_t id;
+  double value;
+};
+FeatureMember readFeatureMember(JsonDoc& doc, std::string_view key, simdjson::ondemand::value& v);
+
+// Reads the members of the feature-row object `row`, calling
+// onFeature(id, value) for each; onFeature returns false for an id given
+// before, which is refused as parseFeatureRow refuses it.
+template <class F>
+void readFeatureRow(JsonDoc& doc, simdjson::ondemand::object row, F&& onFeature) {
+  for (auto member : row) {
+    simdjson::ondemand::field f = doc.take(std::move(member), "");
+    std::string_view key = doc.take(f.unescaped_key(), "");
+    simdjson::ondemand::value v = f.value();
+    const FeatureMember m = readFeatureMember(doc, key, v);
+    if (!onFeature(m.id, m.value)) doc.fail(v, "feature " + std::to_string(m.id) + " appears twice");
+  }
+}
 
 thornvale::FeatureMap parseServerFeatures(std::string_view json, const std::string& name);
 

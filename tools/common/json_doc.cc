@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstring>
 #include <vector>
 
 #include "reliqaclassifier/ServerFeatureText.h"
@@ -51,12 +52,25 @@ std::string quoteForMessage(std::string_view s) {
   return out + "\"";
 }
 
-JsonDoc::JsonDoc(std::string_view text, std::string name, int64_t firstLine)
-    : name_(std::move(name)), firstLine_(firstLine), text_(text.data(), text.size()) {}
+JsonDoc::JsonDoc(std::string_view text, std::string name, int64_t firstLine) : name_(std::move(name)) {
+  reset(text, firstLine);
+}
+
+JsonDoc::JsonDoc(std::string name) : name_(std::move(name)) { reset({}, 1); }
+
+void JsonDoc::reset(std::string_view text, int64_t firstLine) {
+  firstLine_ = firstLine;
+  size_ = text.size();
+  if (buffer_.size() < size_ + simdjson::SIMDJSON_PADDING) buffer_.resize(size_ + simdjson::SIMDJSON_PADDING);
+  if (size_ != 0) std::memcpy(buffer_.data(), text.data(), size_);
+  std::memset(buffer_.data() + size_, 0, simdjson::SIMDJSON_PADDING);
+  doc_ = simdjson::ondemand::document();
+  iterated_ = false;
+}
 
 int64_t JsonDoc::lineOf(const char* at) const {
-  const char* begin = text_.data();
-  const char* end = begin + text_.size();
+  const char* begin = this->begin();
+  const char* end = this->end();
   if (at == nullptr || at < begin) at = begin;
   if (at > end) at = end;
   return firstLine_ + std::count(begin, at, '\n');
@@ -67,7 +81,7 @@ void JsonDoc::fail(const char* at, const std::string& message) const {
 }
 
 void JsonDoc::failSyntax(simdjson::error_code code, const std::string& path) {
-  const char* at = text_.data() + text_.size();
+  const char* at = end();
   if (iterated_) {
     const char* loc = nullptr;
     if (!doc_.current_location().get(loc)) at = loc;
@@ -88,8 +102,8 @@ void JsonDoc::scanStructure() {
   // simdjson reports some structural problems far from where they are (or not
   // at all, for text after the root value), so the brackets, strings and what
   // follows the root value are checked here first.
-  const char* p = text_.data();
-  const char* end = p + text_.size();
+  const char* p = begin();
+  const char* end = this->end();
   auto space = [](char c) { return c == ' ' || c == '\n' || c == '\r' || c == '\t'; };
   while (p < end && space(*p)) ++p;
   if (p == end) fail(p, "no JSON value (the input is empty)");
@@ -121,13 +135,19 @@ void JsonDoc::scanStructure() {
 
 simdjson::ondemand::object JsonDoc::rootObject(const std::string& what) {
   scanStructure();
-  if (auto err = parser_.iterate(text_).get(doc_)) failSyntax(err, "");
+  if (auto err = parser_.iterate(buffer_.data(), size_, buffer_.size()).get(doc_)) failSyntax(err, "");
   iterated_ = true;
   json_type t;
   if (auto err = doc_.type().get(t)) failSyntax(err, "");
   if (t != json_type::object) {
     const char* at = nullptr;
-    if (doc_.current_location().get(at)) at = text_.data();
+    if (doc_.current_location().get(at)) at = begin();
+    // simdjson types a scalar by its first byte: "nope" would be null.
+    const std::string_view token = simdjson::trim(std::string_view(begin(), size_));
+    const bool literal = t == json_type::null ? token == "null"
+                         : t == json_type::boolean ? token == "true" || token == "false"
+                                                   : true;
+    if (!literal) fail(at, "not JSON: " + quoteForMessage(token));
     fail(at, "expected " + what + " (a JSON object), got " + typeWord(t));
   }
   simdjson::ondemand::object obj;
@@ -272,6 +292,31 @@ bool JsonDoc::isNull(simdjson::ondemand::value& v, const std::string& path) {
   bool null = false;
   if (v.is_null().get(null) || !null) fail(v, where(path) + "malformed literal (expected null)");
   return true;
+}
+
+// Whether the text may hold the number -0: a "-0" after ':', ',' or '[' and
+// before ',', '}', ']' or white space. Conservative: such a sequence inside a
+// string counts too.
+bool DomNumbers::mayHoldMinusZero() {
+  if (minusZero_ < 0) {
+    minusZero_ = 0;
+    auto space = [](char c) { return c == ' ' || c == '\n' || c == '\r' || c == '\t'; };
+    const char* begin = text_.data();
+    const char* end = begin + text_.size();
+    for (const char* p = begin; (p = static_cast<const char*>(std::memchr(p, '-', end - p))) != nullptr; ++p) {
+      if (end - p < 2 || p[1] != '0') continue;
+      const char* before = p;
+      while (before > begin && space(before[-1])) --before;
+      const bool opens = before > begin && (before[-1] == ':' || before[-1] == ',' || before[-1] == '[');
+      const char after = end - p > 2 ? p[2] : ' ';
+      const bool closes = after == ',' || after == '}' || after == ']' || space(after);
+      if (opens && closes) {
+        minusZero_ = 1;
+        break;
+      }
+    }
+  }
+  return minusZero_ == 1;
 }
 
 }  // namespace reliqa::tool

@@ -7,12 +7,15 @@
 // to name the value.
 //
 // A JsonDoc owns its padded copy of the text; values obtained from it are valid
-// while it lives. Not thread-safe; use one per thread.
+// while it lives and until reset(). reset() reads another text with the same
+// buffer and parser, so that a stream of short texts allocates nothing per
+// text. Not thread-safe; use one per thread.
 #pragma once
 
 #include <simdjson.h>
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -23,6 +26,11 @@ class JsonDoc {
   // `name` is used in messages; `firstLine` is the line number of the text's
   // first byte in that file.
   JsonDoc(std::string_view text, std::string name, int64_t firstLine = 1);
+  // A document without a text yet: call reset() before reading.
+  explicit JsonDoc(std::string name);
+
+  // Takes another text (the values read from the previous one become invalid).
+  void reset(std::string_view text, int64_t firstLine = 1);
 
   // The root value, which must be an object; `what` names it in messages
   // ("a collection"). Throws ToolError otherwise.
@@ -69,12 +77,45 @@ class JsonDoc {
  private:
   void scanStructure();
 
+  const char* begin() const { return buffer_.data(); }
+  const char* end() const { return buffer_.data() + size_; }
+
   std::string name_;
-  int64_t firstLine_;
-  simdjson::padded_string text_;
+  int64_t firstLine_ = 1;
+  std::string buffer_;  // the text, then simdjson's padding
+  size_t size_ = 0;
   simdjson::ondemand::parser parser_;
   simdjson::ondemand::document doc_;
   bool iterated_ = false;
+};
+
+// Numbers of a text that simdjson's DOM has validated, read as
+// JsonDoc::getDouble reads them. The DOM reads "-0" as the integer 0, so an
+// integer 0 is vouched for only when the text holds no "-0" that could be a
+// number (checked once per text, when first needed).
+class DomNumbers {
+ public:
+  explicit DomNumbers(std::string_view text) : text_(text) {}
+
+  // The number `v` holds; nothing when `v` is not a number, or may be -0.
+  std::optional<double> read(simdjson::dom::element v) {
+    switch (v.type()) {
+      case simdjson::dom::element_type::DOUBLE: return v.get_double().value_unsafe();
+      case simdjson::dom::element_type::UINT64: return static_cast<double>(v.get_uint64().value_unsafe());
+      case simdjson::dom::element_type::INT64: {
+        const int64_t i = v.get_int64().value_unsafe();
+        if (i == 0 && mayHoldMinusZero()) return std::nullopt;
+        return static_cast<double>(i);
+      }
+      default: return std::nullopt;
+    }
+  }
+
+ private:
+  bool mayHoldMinusZero();
+
+  std::string_view text_;
+  int minusZero_ = -1;  // unknown until needed
 };
 
 // Quotes a key for messages: "abc" (control bytes escaped, long keys cut).
